@@ -1,0 +1,39 @@
+#!/bin/bash
+# Runs every test: installs the Debian packages that are missing, builds the
+# native build with ASan and UBSan and the PowerPC cross build, and runs the
+# whole suite of both (the PowerPC one under qemu-ppc). Needs root.
+# The last line is "N passed, N failed" over both builds.
+set -uo pipefail
+cd "$(dirname "$0")/.."
+# shellcheck source=scripts/deps.sh
+. scripts/deps.sh
+vexo_install_deps || exit 1
+
+total_pass=0
+total_fail=0
+status=0
+for preset in asan ppc; do
+    echo "=== $preset: configure and build"
+    if ! cmake --preset "$preset" >/dev/null || ! cmake --build --preset "$preset"; then
+        echo "build $preset failed"
+        status=1
+        total_fail=$((total_fail + 1))
+        continue
+    fi
+    echo "=== $preset: tests"
+    log="build/$preset/ctest-summary.log"
+    ctest --preset "$preset" 2>&1 | tee "$log"
+    [ "${PIPESTATUS[0]}" -eq 0 ] || status=1
+    summary=$(grep -E '[0-9]+% tests passed, [0-9]+ tests? failed out of [0-9]+' "$log" | tail -n 1)
+    if [ -z "$summary" ]; then
+        total_fail=$((total_fail + 1))
+        status=1
+        continue
+    fi
+    failed=$(sed -E 's/.* ([0-9]+) tests? failed out of ([0-9]+).*/\1/' <<<"$summary")
+    all=$(sed -E 's/.* failed out of ([0-9]+).*/\1/' <<<"$summary")
+    total_pass=$((total_pass + all - failed))
+    total_fail=$((total_fail + failed))
+done
+echo "${total_pass} passed, ${total_fail} failed"
+exit "$status"

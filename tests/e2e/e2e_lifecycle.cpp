@@ -1,0 +1,108 @@
+// The daemon's lifecycle, run as the real binary in the sandbox.
+#include <signal.h>
+#include <sys/stat.h>
+
+#include <gtest/gtest.h>
+
+#include "harness.hpp"
+
+namespace {
+
+constexpr char kPidFile[] = "/var/run/vexorcd.pid";
+
+TEST(Lifecycle, AnyArgumentPrintsUsageAndTouchesNothing)
+{
+    vt::SyslogSink log;
+    for (const char* arg : {"-h", "start", ""}) {
+        std::string out;
+        const std::string path = vt::BinPath("vexorcd");
+        EXPECT_EQ(vt::RunToEnd({path, arg}, &out), 0) << arg;
+        // A banner line, an empty line, then the usage line.
+        const size_t first = out.find('\n');
+        ASSERT_NE(first, std::string::npos) << out;
+        EXPECT_GT(first, 0u);
+        EXPECT_EQ(out.substr(first), "\n\n" + path + ":\tVexora remote controller daemon.\n");
+        EXPECT_FALSE(vt::PathExists(kPidFile));
+    }
+    EXPECT_TRUE(log.Lines().empty()) << log.Dump();
+}
+
+TEST(Lifecycle, RunsWritesPidFileAndStopsCleanlyOnTermAndInt)
+{
+    vt::SyslogSink log;
+    for (int sig : {SIGTERM, SIGINT}) {
+        vt::Daemon d;
+        const pid_t pid = d.Start(false);
+        ASSERT_GT(pid, 0);
+        // Only the decimal pid, no newline.
+        EXPECT_EQ(vt::ReadFile(kPidFile), std::to_string(pid));
+        EXPECT_TRUE(d.Alive());
+        EXPECT_EQ(d.Stop(sig), 0) << strsignal(sig);
+        EXPECT_FALSE(vt::PathExists(kPidFile));
+        EXPECT_FALSE(vt::PathExists("/tmp/vexoctrl"));
+    }
+    EXPECT_TRUE(log.Lines().empty()) << log.Dump();
+}
+
+TEST(Lifecycle, RefusesToStartBesideALiveInstance)
+{
+    vt::SyslogSink log;
+    vt::Daemon d;
+    const pid_t pid = d.Start(false);
+    ASSERT_GT(pid, 0);
+    std::string out;
+    EXPECT_EQ(vt::RunToEnd({vt::BinPath("vexorcd")}, &out), 0);
+    EXPECT_EQ(out, "vexorcd already exists. pid[" + std::to_string(pid) + "]\n");
+    EXPECT_EQ(vt::ReadFile(kPidFile), std::to_string(pid));
+    EXPECT_TRUE(d.Alive());
+    EXPECT_EQ(d.Stop(), 0);
+}
+
+TEST(Lifecycle, StaleOrGarbagePidFileIsIgnoredAndRewritten)
+{
+    vt::SyslogSink log;
+    // 2^22 + 1 is above the kernel's pid limit, so no process has it.
+    for (const char* stale : {"4194305", "", "garbage", "-1", "99999999999999"}) {
+        vt::WriteFile(kPidFile, stale);
+        vt::Daemon d;
+        const pid_t pid = d.Start(false);
+        ASSERT_GT(pid, 0) << stale;
+        EXPECT_EQ(vt::ReadFile(kPidFile), std::to_string(pid));
+        EXPECT_EQ(d.Stop(), 0);
+    }
+    EXPECT_TRUE(log.Lines().empty()) << log.Dump();
+}
+
+TEST(Lifecycle, UnwritablePidFileIsLoggedAndTheDaemonRunsOn)
+{
+    vt::SyslogSink log;
+    // A directory at the pid file's path cannot be opened for writing, not even by root.
+    unlink(kPidFile);
+    ASSERT_EQ(mkdir(kPidFile, 0755), 0);
+    vt::Daemon d;
+    ASSERT_GT(d.Start(false, false), 0);
+    ASSERT_TRUE(log.WaitFor("Failed to write vexorcd pid"));
+    const auto lines = log.Lines();
+    ASSERT_EQ(lines.size(), 1u) << log.Dump();
+    EXPECT_EQ(lines[0].rfind("vexorcd.cpp (119) Failed to write vexorcd pid [/var/run/vexorcd.pid]. (", 0), 0u)
+        << lines[0];
+    EXPECT_NE(lines[0].find("Is a directory)"), std::string::npos) << lines[0];
+    EXPECT_TRUE(d.Alive());
+    // At shutdown the removal of the missing pid file is harmless.
+    EXPECT_EQ(d.Stop(), 0);
+    EXPECT_EQ(log.Lines().size(), 1u) << log.Dump();
+    rmdir(kPidFile);
+}
+
+TEST(Lifecycle, IgnoresSigpipe)
+{
+    vt::SyslogSink log;
+    vt::Daemon d;
+    ASSERT_GT(d.Start(false), 0);
+    d.Signal(SIGPIPE);
+    usleep(200000);
+    EXPECT_TRUE(d.Alive());
+    EXPECT_EQ(d.Stop(), 0);
+}
+
+}  // namespace
