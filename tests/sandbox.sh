@@ -2,9 +2,10 @@
 # Runs one command as root, as the first process of a private pid namespace
 # (it adopts every orphan, and all that is left dies with it), in a private
 # mount namespace with fresh tmpfs over
-# /tmp, /run (and so /var/run) and /dev, so that the daemon's built-in paths
-# ("/tmp/vexoctrl", "/var/run/vexorcd.pid", "/dev/usb/hiddev5", "/dev/log")
-# are private to the test. Nothing is left on the host when it ends.
+# /tmp, /run, /var and /dev, so that the daemon's built-in paths
+# ("/tmp/vexoctrl", "/var/run/vexorcd.pid", "/dev/usb/hiddev5", "/dev/log",
+# "/var/packages/...") are private to the test. Nothing is left on the host
+# when it ends.
 #
 # Usage: tests/sandbox.sh COMMAND [ARG...]
 set -eu
@@ -27,7 +28,7 @@ fd=20
 declare -a kept_fd kept_dir
 for d in "${keep[@]}"; do
     case "$d" in
-    /tmp|/tmp/*|/run|/run/*|/dev|/dev/*|/var/run|/var/run/*)
+    /tmp|/tmp/*|/run|/run/*|/dev|/dev/*|/var|/var/*)
         eval "exec $fd<\"\$d\""
         kept_fd+=("$fd"); kept_dir+=("$d"); fd=$((fd + 1)) ;;
     esac
@@ -35,7 +36,12 @@ done
 
 mount -t tmpfs -o mode=1777,size=256m vexo-tmp /tmp
 mount -t tmpfs -o mode=0755,size=64m vexo-run /run
+mount -t tmpfs -o mode=0755,size=64m vexo-var /var
 mount -t tmpfs -o mode=0755,size=8m vexo-dev /dev
+ln -s /run /var/run
+ln -s /run/lock /var/lock
+mkdir -p /var/tmp /var/lib /var/log /var/cache
+chmod 1777 /var/tmp
 mknod -m 666 /dev/null c 1 3
 mknod -m 666 /dev/zero c 1 5
 mknod -m 666 /dev/random c 1 8
