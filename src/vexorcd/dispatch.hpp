@@ -12,3 +12,7 @@ constexpr bool RcActionIsDispatchable(RcAction action)
 {
     return action >= RC_ACT_UNMAPPED && action <= RC_ACT_LAST;
 }
+
+// Returns the constant name of an action 0..25 ("RC_ACT_PLAY" for 6), or
+// nullptr for any other value.
+const char* RcActionName(RcAction action);
