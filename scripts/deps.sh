@@ -4,7 +4,7 @@
 VEXO_PACKAGES=(
     cmake make g++ googletest
     g++-powerpc-linux-gnu qemu-user
-    util-linux mount procps psmisc
+    util-linux mount procps groff-base
 )
 
 vexo_install_deps() {
