@@ -1,0 +1,176 @@
+#!/bin/bash
+# The measurements that run the daemon. Runs inside tests/sandbox.sh (private
+# /tmp, /run, /var, /dev and pid namespace), so the daemon uses its built-in
+# paths; started by bench/run.sh.
+#
+# Usage: measure.sh BIN_DIR OUT_FILE
+# Appends "key=value" lines to OUT_FILE. Sizes of the runs come from
+# BENCH_ACTIONS, BENCH_OPEN_ACTIONS, BENCH_SENDERS, BENCH_PER_SENDER and
+# BENCH_IDLE_SECONDS.
+set -uo pipefail
+
+bin=$1
+out=$2
+actions=${BENCH_ACTIONS:-2000}
+open_actions=${BENCH_OPEN_ACTIONS:-2000}
+senders=${BENCH_SENDERS:-4}
+per_sender=${BENCH_PER_SENDER:-2500}
+idle=${BENCH_IDLE_SECONDS:-5}
+failed=0
+
+emit() { echo "$1=$2" >>"$out"; }
+note() { echo "measure: $*" >&2; }
+
+# Every process this script starts, by pid, for the final clean-up.
+started=()
+cleanup() {
+    local p
+    for p in "${started[@]}"; do kill -KILL "$p" 2>/dev/null; done
+}
+trap cleanup EXIT
+
+"$bin/vexobench" sink /tmp/syslog.txt &
+started+=($!)
+for _ in $(seq 100); do [ -S /dev/log ] && break; sleep 0.05; done
+
+# Starts the daemon (with the environment given as arguments) and prints its
+# pid once it serves "/tmp/vexoctrl".
+start_daemon() {
+    rm -f /var/run/vexorcd.pid
+    env "$@" "$bin/vexorcd" || return 1
+    local pid=""
+    for _ in $(seq 200); do
+        [ -s /var/run/vexorcd.pid ] && [ -S /tmp/vexoctrl ] && pid=$(cat /var/run/vexorcd.pid) && break
+        sleep 0.05
+    done
+    [ -n "$pid" ] || return 1
+    echo "$pid"
+}
+
+# Sends SIGTERM and waits until the daemon has gone (it is this script's
+# child once detached, so it is reaped here).
+stop_daemon() {
+    kill -TERM "$1" 2>/dev/null
+    for _ in $(seq 200); do
+        [ -d "/proc/$1" ] || return 0
+        [ "$(awk '{print $3}' "/proc/$1/stat" 2>/dev/null)" = Z ] && { wait "$1" 2>/dev/null; return 0; }
+        sleep 0.05
+    done
+    note "daemon $1 did not stop"
+    kill -KILL "$1" 2>/dev/null
+    return 1
+}
+
+# utime+stime in clock ticks, and the nanoseconds on a CPU.
+cpu_ticks() { awk '{print $14 + $15}' "/proc/$1/stat"; }
+cpu_ns() { awk '{print $1}' "/proc/$1/schedstat"; }
+switches() { awk '/^voluntary_ctxt_switches/ {print $2}' "/proc/$1/status"; }
+
+# Idle figures of a running daemon under the label given: system calls per
+# loop turn (strace -c; a turn is one pause), then CPU time per second and
+# loop turns per second without strace.
+idle_figures() {
+    local pid=$1 label=$2 trace=/tmp/strace-$2.txt
+    timeout -s INT "$idle" strace -c -f -p "$pid" -o "$trace" 2>/dev/null
+    awk -v label="$label" '
+        $1 ~ /^[0-9.]+$/ && NF >= 5 && $NF != "total" { n[$NF] = $4; total += $4 }
+        END {
+            pause = n["clock_nanosleep"] + n["nanosleep"]
+            if (pause == 0) { print label ".turns=0"; exit }
+            printf "%s.turns=%d\n%s.syscalls_per_turn=%.2f\n", label, pause, label, total / pause
+            list = ""
+            for (s in n) list = list sprintf("%s %.2f, ", s, n[s] / pause)
+            sub(/, $/, "", list)
+            print label ".breakdown=" list
+        }' "$trace" >>"$out"
+    local t0 c0 s0 t1 c1 s1 hz
+    hz=$(getconf CLK_TCK)
+    t0=$(cpu_ticks "$pid"); c0=$(cpu_ns "$pid"); s0=$(switches "$pid")
+    sleep "$idle"
+    t1=$(cpu_ticks "$pid"); c1=$(cpu_ns "$pid"); s1=$(switches "$pid")
+    emit "$label.cpu_ms_per_s" "$(awk -v d=$((t1 - t0)) -v hz="$hz" -v s="$idle" 'BEGIN {printf "%.2f", d * 1000 / hz / s}')"
+    emit "$label.oncpu_ms_per_s" "$(awk -v d=$((c1 - c0)) -v s="$idle" 'BEGIN {printf "%.2f", d / 1e6 / s}')"
+    emit "$label.turns_per_s" "$(awk -v d=$((s1 - s0)) -v s="$idle" 'BEGIN {printf "%.0f", d / s}')"
+}
+
+# The receiver as a FIFO with a writer held open: the daemon's wait on it
+# runs its whole 200 ms.
+receiver_open() {
+    rm -f /dev/usb/hiddev5
+    mkfifo /dev/usb/hiddev5
+    exec 7<>/dev/usb/hiddev5
+    kill -USR1 "$1"
+    for _ in $(seq 100); do
+        ls -l "/proc/$1/fd" 2>/dev/null | grep -q /dev/usb/hiddev5 && return 0
+        sleep 0.05
+    done
+    note "the daemon did not open the receiver"
+    return 1
+}
+receiver_close() {
+    kill -USR2 "$1"
+    for _ in $(seq 100); do
+        ls -l "/proc/$1/fd" 2>/dev/null | grep -q /dev/usb/hiddev5 || break
+        sleep 0.05
+    done
+    exec 7<&-
+    rm -f /dev/usb/hiddev5
+}
+
+# 1. The baseline: the same road without the daemon.
+note "baseline ($actions actions)"
+"$bin/vexobench" baseline "$actions" >>"$out" || failed=1
+
+pid=$(start_daemon) || { note "the daemon did not start"; exit 1; }
+started+=("$pid")
+
+# 2. Idle cost, receiver closed and open.
+note "idle, receiver closed"
+idle_figures "$pid" idle_closed
+note "idle, receiver open"
+receiver_open "$pid" && idle_figures "$pid" idle_open
+receiver_close "$pid"
+
+# 3. Latency, receiver closed and open.
+note "latency, receiver closed ($actions actions)"
+"$bin/vexobench" latency "$actions" >>"$out" || failed=1
+note "latency, receiver open ($open_actions actions, 200 ms each)"
+"$bin/vexobench" latency "$open_actions" "$pid" >>"$out" || failed=1
+
+# 4. Throughput with concurrent senders.
+note "throughput ($senders senders x $per_sender actions)"
+"$bin/vexobench" throughput "$senders" "$per_sender" >>"$out" || failed=1
+
+emit memory.vmhwm_kb "$(awk '/^VmHWM/ {print $2}' "/proc/$pid/status")"
+emit memory.vmrss_kb "$(awk '/^VmRSS/ {print $2}' "/proc/$pid/status")"
+emit syslog.measured_runs "$(wc -l </tmp/syslog.txt)"
+stop_daemon "$pid"
+
+# 5. Heap allocations, over every road of the daemon.
+note "allocations"
+: >/tmp/syslog.txt
+pid=$(start_daemon LD_PRELOAD="$bin/libvexoalloc.so" VEXO_ALLOC_REPORT=/tmp/alloc.txt \
+    VEXO_ALLOC_TRACE=/tmp/alloc-trace.txt) || { note "the daemon did not start"; exit 1; }
+started+=("$pid")
+"$bin/vexobench" exercise "$pid" >>"$out" || failed=1
+stop_daemon "$pid"
+sed 's/^/alloc./' /tmp/alloc.txt >>"$out"
+emit syslog.exercise "$(wc -l </tmp/syslog.txt)"
+if [ -s /tmp/alloc-trace.txt ]; then
+    note "allocations after start-up:"
+    cat /tmp/alloc-trace.txt >&2
+fi
+
+# 6. Instruction counts of the hot pure functions.
+if [ -x "$bin/vexohot" ]; then
+    note "instruction counts"
+    for fn in $("$bin/vexohot" list); do
+        valgrind --tool=callgrind --callgrind-out-file=/tmp/cg.out --collect-atstart=no \
+            --toggle-collect="BenchLoop_$fn" "$bin/vexohot" run "$fn" >/tmp/cg.log 2>&1
+        calls=$("$bin/vexohot" calls "$fn")
+        total=$(awk '/^summary:|^totals:/ {print $2; exit}' /tmp/cg.out)
+        emit "instr.$fn" "$(awk -v t="${total:-0}" -v c="$calls" 'BEGIN {printf "%.0f", t / c}')"
+    done
+fi
+
+exit "$failed"
