@@ -1,8 +1,214 @@
 #include "drivers/hw_raytac.hpp"
 
-// Placeholder until the receiver driver is built.
+#include <fcntl.h>
+#include <sys/ioctl.h>
+#include <sys/select.h>
+#include <unistd.h>
+
+#include <cstring>
+
+#include "common/log.hpp"
+#include "common/socket.hpp"
+
+// The request numbers differ between architectures in their direction bits
+// (0x40 on PowerPC, 0x80 on x86); the record sizes are the same on both.
+static_assert(sizeof(hiddev_devinfo) == 28);
+static_assert(offsetof(hiddev_devinfo, vendor) == 16 && offsetof(hiddev_devinfo, version) == 20 &&
+              offsetof(hiddev_devinfo, num_applications) == 24);
+#if defined(__powerpc__) && !defined(__powerpc64__)
+static_assert(HIDIOCGVERSION == 0x40044801u && HIDIOCGDEVINFO == 0x401C4803u);
+#elif defined(__x86_64__) || defined(__i386__)
+static_assert(HIDIOCGVERSION == 0x80044801u && HIDIOCGDEVINFO == 0x801C4803u);
+#endif
+
 RcDriver raytac = {"raytac", "/dev/usb/hiddev5", -1, RaytacOpen, RaytacRead, RaytacClose};
 
-std::int32_t RaytacOpen() { return -1; }
-std::int32_t RaytacRead() { return 0; }
-std::int32_t RaytacClose() { return 0; }
+const RcKeyEntry RaytacKeyMap[] = {
+    {0x0007004F, RC_ACT_STOP, "Stop"},               // Right Arrow
+    {0x00070053, RC_ACT_STOP, "Stop"},               // Keypad Num Lock
+    {0x00070051, RC_ACT_RADIO, "Radio"},             // Down Arrow
+    {0x00070052, RC_ACT_IPOD, "iPod"},               // Up Arrow
+    {0x0007002C, RC_ACT_PLAY, "Play"},               // Spacebar
+    {0x00070011, RC_ACT_NEXT, "Next"},               // n
+    {0x00070013, RC_ACT_PREV, "Previous"},           // p
+    {0x00070057, RC_ACT_VOLUME_UP, "Volume Plus"},   // Keypad +
+    {0x00070056, RC_ACT_VOLUME_DOWN, "Volume Minus"},  // Keypad -
+    {0x00070058, RC_ACT_TOGGLE_SHUFFLE, "Toggle Shuffle"},  // Keypad Enter
+    {0x00070059, RC_ACT_TOGGLE_REPEAT, "Toggle Repeat"},    // Keypad 1
+    {0x00070050, RC_ACT_PLAYLIST, "Playlist"},       // Left Arrow
+    {0x00070049, RC_ACT_RANDOM100, "Random 100"},    // Insert
+    {0x00070061, RC_ACT_CUSTOM1, "Custom 1"},        // Keypad 9
+    {0x00070062, RC_ACT_CUSTOM2, "Custom 2"},        // Keypad 0
+    {0x00070063, RC_ACT_CUSTOM3, "Custom 3"},        // Keypad .
+    {0x00070064, RC_ACT_CUSTOM4, "Custom 4"},        // Non-US backslash
+    {0, RC_ACT_NONE, nullptr},
+};
+static_assert(sizeof RaytacKeyMap / sizeof RaytacKeyMap[0] == RAYTAC_KEY_COUNT + 1);
+
+RaytacHoldState RaytacHold = {0, 0, RC_ACT_NONE};
+
+namespace {
+
+// The largest read: hiddev hands over whole events, as many as fit.
+constexpr int RAYTAC_READ_MAX = 512;
+
+// Offers the last key (if any) with result r.
+RaytacHandOver HandOver(const RaytacHoldState& state, RcAction r)
+{
+    return {r, state.lastCode != 0, state.lastCode};
+}
+
+RaytacHandOver OnIdle(RaytacHoldState& state)
+{
+    if (state.heldAction == RC_ACT_NONE)
+        return {RC_ACT_NONE, false, 0};
+    // A held volume key steps again at every idle wait, until its release.
+    if (RcActionIsVolume(state.heldAction))
+        return HandOver(state, state.heldAction);
+    if (!RcActionHasLongPress(state.heldAction))
+        return HandOver(state, RC_ACT_NONE);
+    if (state.idleCycles <= 2) {
+        ++state.idleCycles;
+        return HandOver(state, RC_ACT_NONE);
+    }
+    // The fourth idle wait: a long press, given once; the release then gives nothing.
+    const RcAction held = RcActionHeldVariant(state.heldAction);
+    state.heldAction = RC_ACT_NONE;
+    return HandOver(state, held);
+}
+
+}  // namespace
+
+const RcKeyEntry* RaytacKeyFind(std::uint32_t usage)
+{
+    for (const RcKeyEntry* e = RaytacKeyMap; e->label != nullptr; ++e)
+        if (e->code == usage)
+            return e;
+    return nullptr;
+}
+
+RaytacHandOver RaytacStep(RaytacHoldState& state, const RaytacEvent& event)
+{
+    if (event.idle)
+        return OnIdle(state);
+
+    RcAction action = RC_ACT_NONE;
+    if (event.key.value != RAYTAC_PRESSED) {
+        // Released before the long press was reached: the short action, with
+        // the code offered once more.
+        if (RcActionHasLongPress(state.heldAction)) {
+            const RcAction shortAction = state.heldAction;
+            state.heldAction = RC_ACT_NONE;
+            return HandOver(state, shortAction);
+        }
+        state.lastCode = 0;
+    } else {
+        state.lastCode = event.key.hid;
+        const RcKeyEntry* entry = RaytacKeyFind(event.key.hid);
+        action = entry != nullptr ? entry->action : RC_ACT_UNMAPPED;
+    }
+    state.idleCycles = 0;
+    state.heldAction = action;
+    // A long-press key decides at its release or on the idle waits.
+    return HandOver(state, RcActionHasLongPress(action) ? RC_ACT_NONE : action);
+}
+
+std::int32_t RaytacOpen()
+{
+    if (raytac.descriptor >= 0)
+        return 0;
+    const int fd = open(raytac.devicePath, O_RDONLY);
+    if (fd < 0)
+        return -1;
+    raytac.descriptor = fd;
+    // A key that was down when the receiver went away never sends its
+    // release to us: forget it, or a held volume key would step on its own
+    // at every idle wait.
+    RaytacHold = RaytacHoldState{0, 0, RC_ACT_NONE};
+    HiddevDescribe(fd);
+    return 0;
+}
+
+std::int32_t RaytacRead()
+{
+    const int fd = raytac.descriptor;
+    if (fd < 0)
+        return 0;
+    // select cannot watch a descriptor beyond its set; the daemon holds a handful.
+    if (fd >= FD_SETSIZE)
+        return -1;
+
+    RaytacEvent event {};
+    fd_set readable;
+    FD_ZERO(&readable);
+    FD_SET(fd, &readable);
+    timeval wait {};
+    wait.tv_usec = RAYTAC_WAIT_US;
+    // A time-out, and a wait cut short by a signal, are both idle waits.
+    if (select(fd + 1, &readable, nullptr, nullptr, &wait) <= 0) {
+        event.idle = true;
+    } else {
+        unsigned char report[RAYTAC_READ_MAX];
+        const ssize_t count = read(fd, report, sizeof report);
+        if (count < 0)
+            return -1;
+        if (count < static_cast<ssize_t>(sizeof(hiddev_event))) {
+            LogError(__FILE_NAME__, 304, "Got short read from device!");
+            return -1;
+        }
+        if (count != static_cast<ssize_t>(sizeof(RaytacReport))) {
+            const int bytes = static_cast<int>(count);
+            LogError(__FILE_NAME__, 311, "The hid response is too short. ret:%d (%d)", bytes,
+                     bytes / static_cast<int>(sizeof(hiddev_event)));
+            return -1;
+        }
+        std::memcpy(&event.key, report + RAYTAC_KEY_EVENT * sizeof(hiddev_event), sizeof event.key);
+    }
+
+    const RaytacHandOver result = RaytacStep(RaytacHold, event);
+    if (result.offer && MediaCenterSendKey(result.code) == 0)
+        return RC_ACT_NONE;
+    return result.action;
+}
+
+std::int32_t RaytacClose()
+{
+    if (raytac.descriptor >= 0) {
+        close(raytac.descriptor);
+        raytac.descriptor = -1;
+    }
+    return 0;
+}
+
+void HiddevPrint(std::FILE* out, const std::int32_t* version, const hiddev_devinfo* info)
+{
+    if (version != nullptr)
+        std::fprintf(out, "hiddev driver version is %d.%d.%d\n", *version >> 16,
+                     (*version >> 8) & 0xFF, *version & 0xFF);
+    else
+        std::fprintf(out, "hiddev driver version is unknown\n");
+    if (info == nullptr) {
+        std::fprintf(out, "hiddev device information is unavailable\n");
+        return;
+    }
+    // The identifiers are signed 16-bit fields, printed widened with their sign.
+    std::fprintf(out, "vendor 0x%04x product 0x%04x version 0x%04x ",
+                 static_cast<unsigned>(static_cast<std::int32_t>(info->vendor)),
+                 static_cast<unsigned>(static_cast<std::int32_t>(info->product)),
+                 static_cast<unsigned>(static_cast<std::int32_t>(info->version)));
+    std::fprintf(out, "has %i application%s ", static_cast<int>(info->num_applications),
+                 info->num_applications == 1 ? "" : "s");
+    std::fprintf(out, "and is on bus: %d devnum: %d ifnum: %d\n", static_cast<int>(info->busnum),
+                 static_cast<int>(info->devnum), static_cast<int>(info->ifnum));
+}
+
+void HiddevDescribe(std::int32_t descriptor)
+{
+    int version = 0;
+    hiddev_devinfo info {};
+    const bool haveVersion = ioctl(descriptor, HIDIOCGVERSION, &version) == 0;
+    const bool haveInfo = ioctl(descriptor, HIDIOCGDEVINFO, &info) == 0;
+    const std::int32_t v = version;
+    HiddevPrint(stdout, haveVersion ? &v : nullptr, haveInfo ? &info : nullptr);
+    std::fflush(stdout);
+}
