@@ -1,0 +1,392 @@
+// remote-sim: a stand-in for the radio receiver and its remote control.
+//
+// Makes a FIFO at the receiver's device path (or uses the FIFO that stands
+// there) and writes hiddev key reports into it as a script says: 72 bytes
+// each, nine events {usage, value} in this machine's byte order, the key in
+// the ninth. The writer stays open for the whole script, and with --stay
+// until SIGTERM or SIGINT, because a FIFO whose last writer closes reads as
+// end of file. Before each report it waits (at most --drain-ms) until the
+// reader has taken the previous one, so that every read sees exactly one
+// report; it also waits so after the last one before it exits.
+//
+// Run "remote-sim --help" for the script language.
+#include <fcntl.h>
+#include <signal.h>
+#include <sys/ioctl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cctype>
+#include <cerrno>
+#include <chrono>
+#include <cstdint>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "drivers/hw_raytac.hpp"
+
+namespace {
+
+const char USAGE[] =
+    "usage: %s [--device PATH] [--stay] [--drain-ms MS] STEP...\n"
+    "Writes receiver key reports into a FIFO at PATH (default %s),\n"
+    "making the FIFO if nothing stands there.\n"
+    "Steps:\n"
+    "  press KEY          the key goes down (event value 1)\n"
+    "  release KEY        the key goes up (event value 0)\n"
+    "  tap KEY            press, then release once the press has been read\n"
+    "  hold KEY MS        press, wait MS milliseconds, release\n"
+    "  event KEY VALUE    one report whose key event carries VALUE\n"
+    "  sleep MS           wait MS milliseconds\n"
+    "  raw-size N [KEY]   one malformed write of N bytes (1 to 4096): press\n"
+    "                     reports of KEY (default Play) cut or repeated to N bytes\n"
+    "  keys               list the keys and exit\n"
+    "KEY is a label (\"Play\", \"Volume Plus\"; case, blanks, '-' and '_' do not\n"
+    "matter), an alias (vol+, vol-, prev, shuffle, repeat, random, c1 to c4),\n"
+    "or a HID usage code such as 0x0007002C.\n"
+    "Options:\n"
+    "  --stay          keep the writer open after the script until SIGTERM/SIGINT\n"
+    "  --drain-ms MS   longest wait for the reader before each report (default 5000)\n"
+    "Prints \"ready PATH\" once the writer is open and one line per report written.\n"
+    "Exit status: 0, 1 when a report could not be written, 2 on a usage error.\n";
+
+constexpr int RAW_SIZE_MAX = 4096;
+constexpr std::uint32_t PLAY_USAGE = 0x0007002C;
+
+struct Alias {
+    const char* name;
+    const char* label;
+};
+const Alias ALIASES[] = {
+    {"vol+", "volumeplus"}, {"volup", "volumeplus"},     {"vol-", "volumeminus"},
+    {"voldown", "volumeminus"}, {"prev", "previous"},    {"shuffle", "toggleshuffle"},
+    {"repeat", "togglerepeat"}, {"random", "random100"}, {"c1", "custom1"},
+    {"c2", "custom2"},          {"c3", "custom3"},       {"c4", "custom4"},
+};
+
+enum class Op { Event, Tap, Hold, Sleep, Raw };
+
+struct Step {
+    Op op;
+    std::uint32_t usage = 0;
+    std::int32_t value = 0;  // Event: the event value; Hold, Sleep: ms; Raw: bytes
+};
+
+std::string Normalize(const std::string& text)
+{
+    std::string out;
+    for (const char c : text)
+        if (c != ' ' && c != '-' && c != '_')
+            out += static_cast<char>(std::tolower(static_cast<unsigned char>(c)));
+    return out;
+}
+
+bool ParseNumber(const std::string& text, long long lo, long long hi, long long& out)
+{
+    if (text.empty())
+        return false;
+    char* end = nullptr;
+    errno = 0;
+    const long long v = std::strtoll(text.c_str(), &end, 0);
+    if (errno != 0 || *end != '\0' || v < lo || v > hi)
+        return false;
+    out = v;
+    return true;
+}
+
+bool ParseKey(const std::string& text, std::uint32_t& usage)
+{
+    long long code = 0;
+    if (!text.empty() && std::isdigit(static_cast<unsigned char>(text[0])) &&
+        ParseNumber(text, 0, 0xFFFFFFFFLL, code)) {
+        usage = static_cast<std::uint32_t>(code);
+        return true;
+    }
+    std::string name = Normalize(text);
+    std::string lower;
+    for (const char c : text)
+        lower += static_cast<char>(std::tolower(static_cast<unsigned char>(c)));
+    for (const Alias& a : ALIASES)
+        if (lower == a.name)
+            name = a.label;
+    for (int i = 0; i < RAYTAC_KEY_COUNT; ++i)
+        if (Normalize(RaytacKeyMap[i].label) == name) {
+            usage = RaytacKeyMap[i].code;
+            return true;
+        }
+    return false;
+}
+
+std::string KeyName(std::uint32_t usage)
+{
+    char code[16];
+    std::snprintf(code, sizeof code, "0x%08X", static_cast<unsigned>(usage));
+    const RcKeyEntry* e = RaytacKeyFind(usage);
+    return e != nullptr ? std::string(e->label) + " " + code : std::string("unmapped ") + code;
+}
+
+void ListKeys()
+{
+    for (int i = 0; i < RAYTAC_KEY_COUNT; ++i)
+        std::printf("0x%08X  %s\n", static_cast<unsigned>(RaytacKeyMap[i].code),
+                    RaytacKeyMap[i].label);
+    for (const Alias& a : ALIASES)
+        std::printf("alias %s = %s\n", a.name, a.label);
+}
+
+// One report: the eight events before the key stand for the keyboard's
+// modifier usages (Left Control .. Right GUI), none pressed.
+RaytacReport MakeReport(std::uint32_t usage, std::int32_t value)
+{
+    RaytacReport r {};
+    for (int i = 0; i < RAYTAC_KEY_EVENT; ++i)
+        r.events[i] = hiddev_event {0x000700E0u + static_cast<unsigned>(i), 0};
+    r.events[RAYTAC_KEY_EVENT] = hiddev_event {usage, value};
+    return r;
+}
+
+// Parses the script; false (with a message) on the first bad word.
+bool ParseScript(const std::vector<std::string>& words, std::vector<Step>& steps)
+{
+    for (std::size_t i = 0; i < words.size(); ++i) {
+        const std::string& w = words[i];
+        const std::size_t left = words.size() - i - 1;
+        Step s {};
+        long long n = 0;
+        const auto need = [&](std::size_t count) {
+            if (left >= count)
+                return true;
+            std::fprintf(stderr, "remote-sim: %s needs %zu argument(s)\n", w.c_str(), count);
+            return false;
+        };
+        const auto key = [&](const std::string& text) {
+            if (ParseKey(text, s.usage))
+                return true;
+            std::fprintf(stderr, "remote-sim: unknown key: %s\n", text.c_str());
+            return false;
+        };
+        const auto number = [&](const std::string& text, long long lo, long long hi) {
+            if (ParseNumber(text, lo, hi, n))
+                return true;
+            std::fprintf(stderr, "remote-sim: %s: not a number from %lld to %lld: %s\n",
+                         w.c_str(), lo, hi, text.c_str());
+            return false;
+        };
+        if (w == "press" || w == "release" || w == "tap") {
+            if (!need(1) || !key(words[++i]))
+                return false;
+            s.op = w == "tap" ? Op::Tap : Op::Event;
+            s.value = w == "release" ? 0 : RAYTAC_PRESSED;
+        } else if (w == "hold" || w == "event") {
+            const bool hold = w == "hold";
+            if (!need(2) || !key(words[i + 1]) ||
+                !number(words[i + 2], hold ? 0 : INT32_MIN, hold ? 3600000 : INT32_MAX))
+                return false;
+            i += 2;
+            s.op = hold ? Op::Hold : Op::Event;
+            s.value = static_cast<std::int32_t>(n);
+        } else if (w == "sleep") {
+            if (!need(1) || !number(words[++i], 0, 3600000))
+                return false;
+            s.op = Op::Sleep;
+            s.value = static_cast<std::int32_t>(n);
+        } else if (w == "raw-size") {
+            if (!need(1) || !number(words[++i], 1, RAW_SIZE_MAX))
+                return false;
+            s.op = Op::Raw;
+            s.value = static_cast<std::int32_t>(n);
+            s.usage = PLAY_USAGE;
+            // The key is optional: take the next word only when it names one.
+            if (left >= 2 && ParseKey(words[i + 1], s.usage))
+                ++i;
+        } else {
+            std::fprintf(stderr, "remote-sim: unknown step: %s\n", w.c_str());
+            return false;
+        }
+        steps.push_back(s);
+    }
+    return true;
+}
+
+class Fifo {
+public:
+    explicit Fifo(int drainMs) : drainMs_(drainMs) {}
+    ~Fifo()
+    {
+        if (fd_ >= 0)
+            close(fd_);
+    }
+
+    // Makes or takes the FIFO and opens its writer without waiting for a reader.
+    bool Open(const std::string& path)
+    {
+        struct stat st {};
+        if (stat(path.c_str(), &st) != 0) {
+            if (mkfifo(path.c_str(), 0644) != 0) {
+                std::fprintf(stderr, "remote-sim: mkfifo %s: %s\n", path.c_str(), std::strerror(errno));
+                return false;
+            }
+        } else if (!S_ISFIFO(st.st_mode)) {
+            std::fprintf(stderr, "remote-sim: %s exists and is not a FIFO\n", path.c_str());
+            return false;
+        }
+        // A writer can only be opened without waiting while a reader exists:
+        // hold one of our own for that moment.
+        const int reader = open(path.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC);
+        if (reader >= 0)
+            fd_ = open(path.c_str(), O_WRONLY | O_NONBLOCK | O_CLOEXEC);
+        const int openErrno = errno;
+        if (reader >= 0)
+            close(reader);
+        if (fd_ < 0) {
+            std::fprintf(stderr, "remote-sim: open %s: %s\n", path.c_str(), std::strerror(openErrno));
+            return false;
+        }
+        return true;
+    }
+
+    // Waits until the reader has taken everything written, at most drainMs.
+    void Drain() const
+    {
+        const auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(drainMs_);
+        for (;;) {
+            int queued = 0;
+            if (ioctl(fd_, FIONREAD, &queued) != 0 || queued == 0)
+                return;
+            if (std::chrono::steady_clock::now() >= end)
+                return;
+            std::this_thread::sleep_for(std::chrono::milliseconds(1));
+        }
+    }
+
+    // Writes bytes in one piece after the previous write has been read.
+    bool Write(const void* bytes, std::size_t size, const std::string& what)
+    {
+        Drain();
+        const ssize_t n = write(fd_, bytes, size);
+        if (n == static_cast<ssize_t>(size)) {
+            std::printf("sent %s\n", what.c_str());
+            std::fflush(stdout);
+            return true;
+        }
+        std::fprintf(stderr, "remote-sim: %s not written: %s\n", what.c_str(),
+                     n < 0 ? (errno == EPIPE ? "nobody reads the device" : std::strerror(errno))
+                           : "cut short");
+        return false;
+    }
+
+    bool Report(std::uint32_t usage, std::int32_t value)
+    {
+        const RaytacReport r = MakeReport(usage, value);
+        const char* verb = value == RAYTAC_PRESSED ? "press" : value == 0 ? "release" : "event";
+        std::string what = std::string(verb) + " " + KeyName(usage);
+        if (value != RAYTAC_PRESSED && value != 0)
+            what += " value " + std::to_string(value);
+        return Write(&r, sizeof r, what);
+    }
+
+private:
+    int fd_ = -1;
+    int drainMs_;
+};
+
+void SleepMs(std::int32_t ms) { std::this_thread::sleep_for(std::chrono::milliseconds(ms)); }
+
+bool Run(Fifo& fifo, const Step& s)
+{
+    switch (s.op) {
+    case Op::Event:
+        return fifo.Report(s.usage, s.value);
+    case Op::Tap: {
+        const bool pressed = fifo.Report(s.usage, RAYTAC_PRESSED);
+        return fifo.Report(s.usage, 0) && pressed;
+    }
+    case Op::Hold: {
+        const bool pressed = fifo.Report(s.usage, RAYTAC_PRESSED);
+        SleepMs(s.value);
+        return fifo.Report(s.usage, 0) && pressed;
+    }
+    case Op::Sleep:
+        SleepMs(s.value);
+        return true;
+    case Op::Raw: {
+        const RaytacReport r = MakeReport(s.usage, RAYTAC_PRESSED);
+        std::vector<unsigned char> bytes(static_cast<std::size_t>(s.value));
+        for (std::size_t i = 0; i < bytes.size(); ++i)
+            bytes[i] = reinterpret_cast<const unsigned char*>(&r)[i % sizeof r];
+        return fifo.Write(bytes.data(), bytes.size(),
+                          "raw " + std::to_string(s.value) + " bytes of " + KeyName(s.usage));
+    }
+    }
+    return false;
+}
+
+// Keeps the writer open until SIGTERM or SIGINT, which end the program normally.
+void Stay()
+{
+    sigset_t quit;
+    sigemptyset(&quit);
+    for (const int sig : {SIGTERM, SIGINT})
+        sigaddset(&quit, sig);
+    sigprocmask(SIG_BLOCK, &quit, nullptr);
+    int received = 0;
+    sigwait(&quit, &received);
+}
+
+}  // namespace
+
+int main(int argc, char** argv)
+{
+    std::string device = raytac.devicePath;
+    bool stay = false;
+    long long drainMs = 5000;
+    std::vector<std::string> words;
+    for (int i = 1; i < argc; ++i) {
+        const std::string arg = argv[i];
+        if (arg == "--help" || arg == "-h") {
+            std::printf(USAGE, argv[0], raytac.devicePath);
+            return 0;
+        }
+        if (arg == "keys") {
+            ListKeys();
+            return 0;
+        }
+        if (arg == "--stay") {
+            stay = true;
+        } else if (arg == "--device" && i + 1 < argc) {
+            device = argv[++i];
+        } else if (arg == "--drain-ms" && i + 1 < argc) {
+            if (!ParseNumber(argv[++i], 0, 600000, drainMs)) {
+                std::fprintf(stderr, USAGE, argv[0], raytac.devicePath);
+                return 2;
+            }
+        } else {
+            words.push_back(arg);
+        }
+    }
+    std::vector<Step> steps;
+    if (!ParseScript(words, steps)) {
+        std::fprintf(stderr, USAGE, argv[0], raytac.devicePath);
+        return 2;
+    }
+
+    // A reader that goes away makes writes fail with EPIPE, not kill us.
+    signal(SIGPIPE, SIG_IGN);
+    Fifo fifo(static_cast<int>(drainMs));
+    if (!fifo.Open(device))
+        return 1;
+    std::printf("ready %s\n", device.c_str());
+    std::fflush(stdout);
+
+    bool ok = true;
+    for (const Step& s : steps)
+        ok = Run(fifo, s) && ok;
+    fifo.Drain();
+    if (stay)
+        Stay();
+    return ok ? 0 : 1;
+}
