@@ -32,7 +32,7 @@ TEST(Lifecycle, RunsWritesPidFileAndStopsCleanlyOnTermAndInt)
     vt::SyslogSink log;
     for (int sig : {SIGTERM, SIGINT}) {
         vt::Daemon d;
-        const pid_t pid = d.Start(false);
+        const pid_t pid = d.Start();
         ASSERT_GT(pid, 0);
         // Only the decimal pid, no newline.
         EXPECT_EQ(vt::ReadFile(kPidFile), std::to_string(pid));
@@ -48,7 +48,7 @@ TEST(Lifecycle, RefusesToStartBesideALiveInstance)
 {
     vt::SyslogSink log;
     vt::Daemon d;
-    const pid_t pid = d.Start(false);
+    const pid_t pid = d.Start();
     ASSERT_GT(pid, 0);
     std::string out;
     EXPECT_EQ(vt::RunToEnd({vt::BinPath("vexorcd")}, &out), 0);
@@ -65,7 +65,7 @@ TEST(Lifecycle, StaleOrGarbagePidFileIsIgnoredAndRewritten)
     for (const char* stale : {"4194305", "", "garbage", "-1", "99999999999999"}) {
         vt::WriteFile(kPidFile, stale);
         vt::Daemon d;
-        const pid_t pid = d.Start(false);
+        const pid_t pid = d.Start();
         ASSERT_GT(pid, 0) << stale;
         EXPECT_EQ(vt::ReadFile(kPidFile), std::to_string(pid));
         EXPECT_EQ(d.Stop(), 0);
@@ -80,7 +80,7 @@ TEST(Lifecycle, UnwritablePidFileIsLoggedAndTheDaemonRunsOn)
     unlink(kPidFile);
     ASSERT_EQ(mkdir(kPidFile, 0755), 0);
     vt::Daemon d;
-    ASSERT_GT(d.Start(false, false), 0);
+    ASSERT_GT(d.Start(true, false), 0);
     ASSERT_TRUE(log.WaitFor("Failed to write vexorcd pid"));
     const auto lines = log.Lines();
     ASSERT_EQ(lines.size(), 1u) << log.Dump();
@@ -98,7 +98,7 @@ TEST(Lifecycle, IgnoresSigpipe)
 {
     vt::SyslogSink log;
     vt::Daemon d;
-    ASSERT_GT(d.Start(false), 0);
+    ASSERT_GT(d.Start(), 0);
     d.Signal(SIGPIPE);
     usleep(200000);
     EXPECT_TRUE(d.Alive());

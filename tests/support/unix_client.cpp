@@ -10,14 +10,16 @@ namespace vt {
 
 namespace {
 
-bool Fill(sockaddr_un& addr, const std::string& path)
+// A socket of the given type and the address of path, or -1 when the path
+// does not fit or no socket can be had.
+int OpenFor(const std::string& path, int type, sockaddr_un& addr)
 {
     std::memset(&addr, 0, sizeof addr);
     addr.sun_family = AF_UNIX;
     if (path.size() >= sizeof addr.sun_path)
-        return false;
+        return -1;
     std::memcpy(addr.sun_path, path.c_str(), path.size());
-    return true;
+    return socket(AF_UNIX, type | SOCK_CLOEXEC, 0);
 }
 
 }  // namespace
@@ -25,12 +27,8 @@ bool Fill(sockaddr_un& addr, const std::string& path)
 int ConnectUnix(const std::string& path, int type)
 {
     sockaddr_un addr;
-    if (!Fill(addr, path))
-        return -1;
-    const int fd = socket(AF_UNIX, type | SOCK_CLOEXEC, 0);
-    if (fd < 0)
-        return -1;
-    if (connect(fd, reinterpret_cast<sockaddr*>(&addr), sizeof addr) != 0) {
+    const int fd = OpenFor(path, type, addr);
+    if (fd >= 0 && connect(fd, reinterpret_cast<sockaddr*>(&addr), sizeof addr) != 0) {
         close(fd);
         return -1;
     }
@@ -40,9 +38,7 @@ int ConnectUnix(const std::string& path, int type)
 int BindUnix(const std::string& path, int type)
 {
     sockaddr_un addr;
-    if (!Fill(addr, path))
-        return -1;
-    const int fd = socket(AF_UNIX, type | SOCK_CLOEXEC, 0);
+    const int fd = OpenFor(path, type, addr);
     if (fd < 0)
         return -1;
     unlink(path.c_str());

@@ -110,4 +110,67 @@ TEST(MediaCenterSendKey, AReceiverThatNeverReadsNeverBlocksTheSender)
     unlink(kMediaCenter);
 }
 
+TEST(SocketListenUnix, RefusesAPathThatDoesNotFitInsteadOfTruncatingIt)
+{
+    vt::SyslogSink log;
+    // 107 characters fit with the terminating zero; 108 do not.
+    const std::string fits = "/tmp/" + std::string(102, 'f');
+    const std::string tooLong = "/tmp/" + std::string(103, 'l');
+    ASSERT_EQ(fits.size(), 107u);
+    const int fd = SocketListenUnix(fits.c_str(), 4);
+    EXPECT_GE(fd, 0);
+    close(fd);
+    unlink(fits.c_str());
+
+    EXPECT_EQ(SocketListenUnix(tooLong.c_str(), 4), -1);
+    EXPECT_FALSE(vt::PathExists(tooLong));
+    ASSERT_TRUE(log.WaitFor("socket.cpp"));
+    EXPECT_EQ(log.Lines(), std::vector<std::string>{"socket.cpp (45) Failed to bind socket. (File name too long)"});
+}
+
+// The slot table: at most one connection per call, into the lowest free
+// slot, never when every slot is taken or there are none.
+TEST(SocketAcceptClient, TakesAtMostOneWaitingConnectionIntoTheLowestFreeSlot)
+{
+    const int listener = SocketListenUnix("/tmp/accept-test", 8);
+    ASSERT_GE(listener, 0);
+    const int busy = open("/dev/null", O_RDONLY);  // stands for a held client
+    std::int32_t slots[4] = {busy, -1, busy, -1};
+
+    // Nothing waiting: nothing changes.
+    EXPECT_EQ(SocketAcceptClient(listener, slots, 4), 0);
+    EXPECT_EQ(slots[1], -1);
+    EXPECT_EQ(slots[3], -1);
+
+    std::vector<int> clients;
+    for (int i = 0; i < 3; ++i)
+        clients.push_back(vt::ConnectUnix("/tmp/accept-test"));
+    EXPECT_EQ(SocketAcceptClient(listener, slots, 0), 0);  // no slots, no accept
+
+    EXPECT_EQ(SocketAcceptClient(listener, slots, 4), 0);
+    ASSERT_GE(slots[1], 0);
+    EXPECT_NE(slots[1], busy);
+    EXPECT_EQ(slots[3], -1);  // one per call
+    EXPECT_NE(fcntl(slots[1], F_GETFL) & O_NONBLOCK, 0);
+    EXPECT_EQ(SocketAcceptClient(listener, slots, 4), 0);
+    ASSERT_GE(slots[3], 0);
+
+    // Full: the third stays queued until a slot is free again.
+    const std::int32_t before[4] = {slots[0], slots[1], slots[2], slots[3]};
+    EXPECT_EQ(SocketAcceptClient(listener, slots, 4), 0);
+    EXPECT_EQ(std::memcmp(before, slots, sizeof slots), 0);
+    close(slots[1]);
+    slots[1] = -1;
+    EXPECT_EQ(SocketAcceptClient(listener, slots, 4), 0);
+    EXPECT_GE(slots[1], 0);
+    EXPECT_EQ(SocketAcceptClient(listener, slots, 4), 0);  // none left
+
+    close(slots[1]);
+    close(slots[3]);
+    for (int fd : clients)
+        close(fd);
+    close(busy);
+    close(listener);
+}
+
 }  // namespace
