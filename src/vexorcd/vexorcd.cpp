@@ -3,6 +3,7 @@
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
+#include <ctime>
 #include <unistd.h>
 
 #include "common/log.hpp"
@@ -78,6 +79,13 @@ int RcDaemonMain(int argc, char** argv)
         std::printf("Failed to become daemon.\n");
         return 0;
     }
+
+    // The loop must not allocate. The C library does so lazily on first use:
+    // the time zone at the first syslog message, the stdout buffer at the
+    // first device line of a receiver opened by SIGUSR1. Take the one now
+    // and do without the other (stdout is the null device from here on).
+    tzset();
+    std::setvbuf(stdout, nullptr, _IONBF, 0);
 
     WritePidFile();
     RcDriversOpenAll();
