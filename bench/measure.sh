@@ -68,18 +68,19 @@ switches() { awk '/^voluntary_ctxt_switches/ {print $2}' "/proc/$1/status"; }
 
 # Idle figures of a running daemon under the label given: system calls per
 # loop turn (strace -c; a turn is one pause), then CPU time per second and
-# loop turns per second without strace.
+# loop turns per second without strace (from the voluntary context switches:
+# SLEEPS of them per turn, the pause and the receiver's wait if open).
 idle_figures() {
-    local pid=$1 label=$2 trace=/tmp/strace-$2.txt
+    local pid=$1 label=$2 sleeps=$3 trace=/tmp/strace-$2.txt
     timeout -s INT "$idle" strace -c -f -p "$pid" -o "$trace" 2>/dev/null
     awk -v label="$label" '
         $1 ~ /^[0-9.]+$/ && NF >= 5 && $NF != "total" { n[$NF] = $4; total += $4 }
         END {
-            pause = n["clock_nanosleep"] + n["nanosleep"]
+            pause = ("clock_nanosleep" in n ? n["clock_nanosleep"] : 0) + ("nanosleep" in n ? n["nanosleep"] : 0)
             if (pause == 0) { print label ".turns=0"; exit }
             printf "%s.turns=%d\n%s.syscalls_per_turn=%.2f\n", label, pause, label, total / pause
             list = ""
-            for (s in n) list = list sprintf("%s %.2f, ", s, n[s] / pause)
+            for (s in n) if (n[s] / pause >= 0.005) list = list sprintf("%s %.2f, ", s, n[s] / pause)
             sub(/, $/, "", list)
             print label ".breakdown=" list
         }' "$trace" >>"$out"
@@ -90,7 +91,7 @@ idle_figures() {
     t1=$(cpu_ticks "$pid"); c1=$(cpu_ns "$pid"); s1=$(switches "$pid")
     emit "$label.cpu_ms_per_s" "$(awk -v d=$((t1 - t0)) -v hz="$hz" -v s="$idle" 'BEGIN {printf "%.2f", d * 1000 / hz / s}')"
     emit "$label.oncpu_ms_per_s" "$(awk -v d=$((c1 - c0)) -v s="$idle" 'BEGIN {printf "%.2f", d / 1e6 / s}')"
-    emit "$label.turns_per_s" "$(awk -v d=$((s1 - s0)) -v s="$idle" 'BEGIN {printf "%.0f", d / s}')"
+    emit "$label.turns_per_s" "$(awk -v d=$((s1 - s0)) -v s="$idle" -v k="$sleeps" 'BEGIN {printf "%.0f", d / k / s}')"
 }
 
 # The receiver as a FIFO with a writer held open: the daemon's wait on it
@@ -126,10 +127,34 @@ started+=("$pid")
 
 # 2. Idle cost, receiver closed and open.
 note "idle, receiver closed"
-idle_figures "$pid" idle_closed
+idle_figures "$pid" idle_closed 1
 note "idle, receiver open"
-receiver_open "$pid" && idle_figures "$pid" idle_open
+receiver_open "$pid" && idle_figures "$pid" idle_open 2
 receiver_close "$pid"
+
+# System calls of one action beyond the idle turn's three (receiver closed):
+# counted with strace over a run of sequential actions.
+note "system calls per action"
+strace -c -f -p "$pid" -o /tmp/strace-actions.txt 2>/dev/null &
+tracer=$!
+sleep 1
+"$bin/vexobench" latency 300 >/dev/null || failed=1
+kill -INT "$tracer"
+wait "$tracer"
+awk -v n=300 '
+    $1 ~ /^[0-9.]+$/ && NF >= 5 && $NF != "total" { c[$NF] = $4; total += $4 }
+    END {
+        pause = ("clock_nanosleep" in c ? c["clock_nanosleep"] : 0) + ("nanosleep" in c ? c["nanosleep"] : 0)
+        # The two polls of every turn; select is pselect6 on some machines.
+        poll = ("pselect6" in c) ? "pselect6" : "select"
+        c[poll] -= 2 * pause
+        delete c["clock_nanosleep"]; delete c["nanosleep"]
+        printf "action.syscalls=%.2f\n", (total - 3 * pause) / n
+        list = ""
+        for (s in c) if (c[s] / n >= 0.005) list = list sprintf("%s %.2f, ", s, c[s] / n)
+        sub(/, $/, "", list)
+        print "action.breakdown=" list
+    }' /tmp/strace-actions.txt >>"$out"
 
 # 3. Latency, receiver closed and open.
 note "latency, receiver closed ($actions actions)"
@@ -165,8 +190,10 @@ fi
 if [ -x "$bin/vexohot" ]; then
     note "instruction counts"
     for fn in $("$bin/vexohot" list); do
+        toggles=()
+        for t in $("$bin/vexohot" toggles "$fn"); do toggles+=("--toggle-collect=$t"); done
         valgrind --tool=callgrind --callgrind-out-file=/tmp/cg.out --collect-atstart=no \
-            --toggle-collect="BenchLoop_$fn" "$bin/vexohot" run "$fn" >/tmp/cg.log 2>&1
+            "${toggles[@]}" "$bin/vexohot" run "$fn" >/tmp/cg.log 2>&1
         calls=$("$bin/vexohot" calls "$fn")
         total=$(awk '/^summary:|^totals:/ {print $2; exit}' /tmp/cg.out)
         emit "instr.$fn" "$(awk -v t="${total:-0}" -v c="$calls" 'BEGIN {printf "%.0f", t / c}')"

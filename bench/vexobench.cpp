@@ -15,6 +15,7 @@
 #include <fcntl.h>
 #include <poll.h>
 #include <signal.h>
+#include <sys/ioctl.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
@@ -46,6 +47,10 @@ constexpr char MEDIA_PATH[] = "/tmp/MediaCenter.sock";
 constexpr char RECEIVER_PATH[] = "/dev/usb/hiddev5";
 constexpr std::size_t RECORD_SIZE = 8196;
 constexpr int LAST_ACTION = 25;
+// Random waits before each timed action: over several loop turns (one turn
+// is the 100 µs pause plus the polls), or over the receiver's 200 ms wait.
+constexpr int LOOP_JITTER_US = 1000;
+constexpr int RECEIVER_WAIT_US = 200000;
 
 using Clock = std::chrono::steady_clock;
 
@@ -333,13 +338,18 @@ public:
     Receiver(const Receiver&) = delete;
     Receiver& operator=(const Receiver&) = delete;
 
-    // Writes one 72-byte report whose ninth event is (usage, value).
+    // Writes one 72-byte report whose ninth event is (usage, value), and
+    // waits until the daemon has read it: two reports in the pipe at once
+    // would be read as one of the wrong size.
     void Report(std::uint32_t usage, std::int32_t value, std::size_t length = 72) const
     {
         unsigned char report[80] = {};
         std::memcpy(report + 64, &usage, sizeof usage);
         std::memcpy(report + 68, &value, sizeof value);
         (void)!write(writer_, report, std::min(length, sizeof report));
+        int pending = 1;
+        for (int i = 0; i < 200 && ioctl(writer_, FIONREAD, &pending) == 0 && pending > 0; ++i)
+            std::this_thread::sleep_for(std::chrono::milliseconds(5));
     }
 
 private:
@@ -366,8 +376,9 @@ Summary Summarise(std::vector<std::int64_t> ns)
 
 // Sends n actions to path one after another, each once the previous record
 // has arrived, and times each from the connect to the record's last byte.
-// maxJitterUs > 0 waits a random time below it before each send, so that
-// actions land at every point of the daemon's loop.
+// Before each send it waits a random time below maxJitterUs, so that actions
+// land at every point of the daemon's loop rather than right after its
+// previous exchange.
 int MeasureLatency(const char* label, const char* path, int n, int maxJitterUs)
 {
     AudioPeer peer;
@@ -380,8 +391,7 @@ int MeasureLatency(const char* label, const char* path, int n, int maxJitterUs)
     int lost = 0;
     for (int i = 0; i < n; ++i) {
         const std::int32_t action = actions[static_cast<std::size_t>(i) % actions.size()];
-        if (maxJitterUs > 0)
-            std::this_thread::sleep_for(std::chrono::microseconds(jitter(rng)));
+        std::this_thread::sleep_for(std::chrono::microseconds(jitter(rng)));
         const std::uint64_t before = peer.Received();
         const std::int64_t t0 = NowNs();
         if (!SendAction(path, action)) {
@@ -451,7 +461,7 @@ int Baseline(int n)
     if (relay == 0)
         RunRelay(listenFd);
     close(listenFd);
-    const int rc = MeasureLatency("baseline", RELAY_PATH, n, 0);
+    const int rc = MeasureLatency("baseline", RELAY_PATH, n, LOOP_JITTER_US);
     kill(relay, SIGKILL);
     waitpid(relay, nullptr, 0);
     unlink(RELAY_PATH);
@@ -680,11 +690,10 @@ int main(int argc, char** argv)
     if (cmd == "sink")
         Sink(argv[2]);
     if (cmd == "latency" && argc == 3)
-        return MeasureLatency("closed", CTRL_PATH, n, 0);
+        return MeasureLatency("closed", CTRL_PATH, n, LOOP_JITTER_US);
     if (cmd == "latency" && argc == 4) {
-        // One whole receiver wait per action on average: land at random points of it.
         Receiver rx(static_cast<pid_t>(std::atoi(argv[3])));
-        return MeasureLatency("open", CTRL_PATH, n, 200000);
+        return MeasureLatency("open", CTRL_PATH, n, RECEIVER_WAIT_US);
     }
     if (cmd == "baseline")
         return Baseline(n);
