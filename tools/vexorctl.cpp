@@ -163,11 +163,14 @@ bool SendOne(RcAction action, const char* typed)
             ready = poll(&pfd, 1, TAKE_TIMEOUT_MS);
         while (ready < 0 && errno == EINTR);
         char byte;
-        if (ready == 1 && recv(fd, &byte, 1, 0) <= 0)
+        const ssize_t got = ready == 1 ? recv(fd, &byte, 1, 0) : -1;
+        if (got == 0 || (got < 0 && ready == 1 && errno == ECONNRESET))
             taken = true;
         else if (ready == 0)
             std::fprintf(stderr, "%s: %s: vexorcd has not taken the action within %d s; it may still act on it\n",
                          PROGRAM, typed, TAKE_TIMEOUT_MS / 1000);
+        else if (got > 0)
+            std::fprintf(stderr, "%s: %s: unexpected reply on %s\n", PROGRAM, typed, CONTROL_SOCKET);
         else
             Fail("no answer from vexorcd", typed);
     }

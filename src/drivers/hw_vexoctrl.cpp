@@ -21,8 +21,8 @@ constexpr std::int32_t CTRL_SOCK_BACKLOG = 4;
 // The action message: one native-order 32-bit code per connection.
 static_assert(sizeof(RcAction) == 4);
 
-// Waits for nothing: the slots whose client has data or has closed, in a
-// set, or a negative count on failure.
+// Marks in ready the held clients that have data or have hung up, without
+// waiting; returns select's count, negative on failure.
 int SelectReadyClients(fd_set& ready)
 {
     FD_ZERO(&ready);
