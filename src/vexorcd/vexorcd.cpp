@@ -45,8 +45,15 @@ void WritePidFile()
                  std::strerror(errno));
         return;
     }
-    std::fprintf(f, "%d", static_cast<int>(getpid()));
-    std::fclose(f);
+    // The pid reaches the file only when the stream is flushed: on a full
+    // file system the open succeeds and the close fails. An empty pid file
+    // would let a second instance start beside this one, so it goes.
+    const bool printed = std::fprintf(f, "%d", static_cast<int>(getpid())) > 0;
+    if (std::fclose(f) != 0 || !printed) {
+        LogError(__FILE_NAME__, 119, "Failed to write vexorcd pid [%s]. (%s)", RC_PID_FILE,
+                 std::strerror(errno));
+        unlink(RC_PID_FILE);
+    }
 }
 
 // Installs a handler that stays installed; interrupted blocking socket calls
