@@ -120,14 +120,17 @@ void AudioPeer::Serve(int fd)
     std::memcpy(&cmd.code, record, sizeof cmd.code);
     std::memcpy(cmd.arg.data(), record + 4, cmd.arg.size());
 
+    // A client that gave up has closed its end: the answer must fail with
+    // EPIPE, never raise SIGPIPE (under the emulator, as the sandbox's pid 1,
+    // that signal hangs the whole test instead of being ignored).
     switch (mode) {
     case Mode::Answer:
     case Mode::StopAccepting:
-        (void)!write(fd, "k", 1);
+        (void)!send(fd, "k", 1, MSG_NOSIGNAL);
         break;
     case Mode::AnswerLate:
         std::this_thread::sleep_for(std::chrono::milliseconds(delayMs));
-        (void)!write(fd, "k", 1);
+        (void)!send(fd, "k", 1, MSG_NOSIGNAL);
         break;
     case Mode::NeverAnswer:
         break;
