@@ -3,6 +3,7 @@
 #include <cerrno>
 #include <climits>
 #include <csignal>
+#include <cstring>
 #include <fcntl.h>
 #include <unistd.h>
 
@@ -63,4 +64,30 @@ int VLIBCProcAlive(int pid)
     if (kill(pid, 0) == 0)
         return 1;
     return errno == EPERM ? 1 : 0;
+}
+
+namespace {
+
+// White space of the C locale.
+bool IsTrimSpace(char c)
+{
+    return c == ' ' || c == '\t' || c == '\n' || c == '\r' || c == '\v' || c == '\f';
+}
+
+}  // namespace
+
+int VLIBCStrTrimSpace(char* text, int flags)
+{
+    if (text == nullptr || flags != 0)
+        return -1;
+    std::size_t begin = 0;
+    while (IsTrimSpace(text[begin]))
+        ++begin;
+    std::size_t end = begin + std::strlen(text + begin);
+    while (end > begin && IsTrimSpace(text[end - 1]))
+        --end;
+    const std::size_t n = end - begin;
+    std::memmove(text, text + begin, n);
+    text[n] = '\0';
+    return static_cast<int>(n);
 }

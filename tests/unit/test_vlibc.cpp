@@ -1,5 +1,8 @@
-// The system library stand-in: pid files and liveness.
+// The system library stand-in: pid files, liveness and trimming.
 #include <unistd.h>
+
+#include <cstdio>
+#include <cstring>
 
 #include <gtest/gtest.h>
 
@@ -35,6 +38,27 @@ TEST(VlibcProcAlive, ProbesWithoutSignallingAndRefusesGroupPids)
     EXPECT_EQ(VLIBCProcAlive(4194305), 0);  // above the kernel's pid limit
     EXPECT_EQ(VLIBCProcAlive(0), 0);
     EXPECT_EQ(VLIBCProcAlive(-1), 0);
+}
+
+}  // namespace
+
+namespace {
+
+TEST(VlibcTrim, TrimsBothEndsInPlace)
+{
+    const struct { const char* in; const char* out; } cases[] = {
+        {"  a b \t\n", "a b"}, {"x", "x"}, {"", ""}, {" \t\r\n\v\f", ""}, {"\n 1.5 -2\r\n", "1.5 -2"},
+    };
+    for (const auto& c : cases) {
+        char text[32];
+        std::snprintf(text, sizeof text, "%s", c.in);
+        EXPECT_EQ(VLIBCStrTrimSpace(text, 0), static_cast<int>(std::strlen(c.out))) << c.in;
+        EXPECT_STREQ(text, c.out);
+    }
+    char keep[] = " k ";
+    EXPECT_EQ(VLIBCStrTrimSpace(keep, 1), -1);  // no flags are defined
+    EXPECT_STREQ(keep, " k ");
+    EXPECT_EQ(VLIBCStrTrimSpace(nullptr, 0), -1);
 }
 
 }  // namespace
