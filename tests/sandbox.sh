@@ -16,7 +16,8 @@ if [ "${VEXO_IN_SANDBOX:-}" != 1 ]; then
         exit 2
     fi
     export VEXO_IN_SANDBOX=1
-    exec unshare --mount --propagation private --pid --fork --mount-proc -- "$0" "$@"
+    # --kill-child: a test that times out dies with its namespace.
+    exec unshare --mount --propagation private --pid --fork --kill-child --mount-proc -- "$0" "$@"
 fi
 
 here=$(cd "$(dirname "$0")/.." && pwd)
