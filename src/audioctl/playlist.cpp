@@ -19,9 +19,12 @@ std::int32_t AudioCtrlSendRecord(std::int32_t code, const AudioPlaylistRecord* r
         LogClientError(__FILE_NAME__, 26, "Bad parameter");
         return -1;
     }
-    AudioCmdRecord request {};
+    // The copy fills all but the last 320 bytes of the argument area: zero
+    // only those, not the whole 8 KiB first.
+    AudioCmdRecord request;
     request.code = code;
     std::memcpy(request.arg, record, sizeof *record);
+    std::memset(request.arg + sizeof *record, 0, sizeof request.arg - sizeof *record);
     return AudioCtrlDeliver(request);
 }
 
