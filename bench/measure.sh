@@ -197,6 +197,7 @@ if [ -x "$bin/vexohot" ]; then
         calls=$("$bin/vexohot" calls "$fn")
         total=$(awk '/^summary:|^totals:/ {print $2; exit}' /tmp/cg.out)
         emit "instr.$fn" "$(awk -v t="${total:-0}" -v c="$calls" 'BEGIN {printf "%.0f", t / c}')"
+        emit "instr_what.$fn" "$("$bin/vexohot" describe "$fn")"
     done
 fi
 
