@@ -143,4 +143,15 @@ EOF
 echo "$results"
 echo "$results" >bench/RESULTS.md
 echo "(written to bench/RESULTS.md; raw figures in $raw)"
+
+# The budget that holds whatever the machine's speed: the command fails
+# when the daemon costs more than its design asks for.
+over() { echo "OVER BUDGET: $*"; status=1; }
+[ "$(get alloc.loop_allocs)" = 0 ] || over "heap allocations after start-up: $(get alloc.loop_allocs)"
+[ "$(get idle_closed.syscalls_per_turn)" = 3.00 ] || over "system calls per idle turn, receiver closed: $(get idle_closed.syscalls_per_turn)"
+[ "$(get idle_open.syscalls_per_turn)" = 4.00 ] || over "system calls per idle turn, receiver open: $(get idle_open.syscalls_per_turn)"
+[ "$(get throughput.lost)/$(get throughput.duplicated)/$(get throughput.garbled)" = 0/0/0 ] ||
+    over "throughput lost/duplicated/garbled: $(get throughput.lost)/$(get throughput.duplicated)/$(get throughput.garbled)"
+[ "$(get needed.ppc)" = libc.so.6 ] || over "PowerPC run-time libraries: $(get needed.ppc)"
+[ "$(get syslog.measured_runs)" = 0 ] || over "syslog lines during the measured runs: $(get syslog.measured_runs)"
 exit "$status"
