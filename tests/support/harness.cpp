@@ -419,7 +419,10 @@ pid_t FindAdoptedChild(pid_t exclude)
 
 }  // namespace
 
-bool ProbeControlSocket(int timeoutMs)
+namespace {
+
+// One probe: connect, send action 0, wait for the daemon to hang up.
+bool ProbeOnce(int timeoutMs)
 {
     const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
     if (fd < 0)
@@ -438,6 +441,24 @@ bool ProbeControlSocket(int timeoutMs)
     }
     close(fd);
     return served;
+}
+
+}  // namespace
+
+bool ProbeControlSocket(int timeoutMs)
+{
+    // A file left at the path by an earlier run refuses connections until
+    // the daemon has replaced it: try again until the time is up.
+    const auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(timeoutMs);
+    for (;;) {
+        const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(
+            end - std::chrono::steady_clock::now()).count();
+        if (left <= 0)
+            return false;
+        if (ProbeOnce(static_cast<int>(left)))
+            return true;
+        std::this_thread::sleep_for(std::chrono::milliseconds(20));
+    }
 }
 
 pid_t Daemon::Start(bool waitForControlSocket, bool expectPidFile)
