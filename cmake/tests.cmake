@@ -54,3 +54,13 @@ foreach(src ${SCRIPT_TESTS})
   set_tests_properties(script.${name} PROPERTIES TIMEOUT 600 LABELS script
     ENVIRONMENT "VEXO_BIN_DIR=${CMAKE_BINARY_DIR}/bin;VEXO_SOURCE_DIR=${CMAKE_SOURCE_DIR};VEXO_EMULATOR=${VEXO_EMULATOR_TEXT}")
 endforeach()
+
+# Soak runs (tests/soak/soak_*.cpp) start the real daemon like the end-to-end
+# tests. ctest runs a short one; tests/soak/run.sh runs them for longer.
+file(GLOB SOAK_TESTS CONFIGURE_DEPENDS tests/soak/soak_*.cpp)
+foreach(src ${SOAK_TESTS})
+  vexo_add_test(soak ${src})
+  get_filename_component(name ${src} NAME_WE)
+  add_dependencies(${name} vexorcd)
+  set_tests_properties(soak.${name} PROPERTIES ENVIRONMENT "VEXO_SOAK_SECONDS=40")
+endforeach()
