@@ -250,9 +250,11 @@ TEST_F(Faults, ReceiverGoneInTheMiddleOfAPress)
     allowed_ = {kShortRead};
     audio_.emplace(Mode::Answer);
     Start(true);
-    ASSERT_TRUE(vt::WriteReport(*fifo_, kVolumeUpKey, 1));
-    // The writer goes with the key down, before any idle wait could step the
-    // volume again: every read now ends at end of file.
+    // The writer goes right after the press, with the key down: the daemon
+    // reads the press, and from then on every read ends at end of file; no
+    // idle wait can come between them to step the volume again.
+    const auto press = vt::KeyReport(kVolumeUpKey, 1);
+    ASSERT_TRUE(fifo_->Write(press.data(), press.size()));
     const auto gone = std::chrono::steady_clock::now();
     fifo_.reset();
     ASSERT_TRUE(audio_->WaitForCount(1));

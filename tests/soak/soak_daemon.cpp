@@ -601,9 +601,12 @@ bool Soak::RunPhase(int kind)
         daemon_.SetReceiver(true);
         Clients(phase, 2, now + Ms(1500));
         phase.pressed.push_back(kVolumeUpKey.usage);
-        EXPECT_TRUE(Write(kVolumeUpKey.usage, 1));
+        // The writer goes right after the press: the daemon reads it, then
+        // end of file on every read, with no idle wait between them.
+        const auto press = vt::KeyReport(kVolumeUpKey.usage, 1);
+        EXPECT_TRUE(fifo_->Write(press.data(), press.size()));
         phase.sent[kKeys].push_back(kVolumeUpKey.action);
-        fifo_.reset();  // the writer goes: the reads see end of file
+        fifo_.reset();
         std::this_thread::sleep_for(Ms(300));
         daemon_.SetReceiver(false);
         fifo_.emplace(kReceiverPath);
