@@ -68,6 +68,8 @@ void Usage(std::FILE* out, const char* argv0)
 
 bool ParseCount(const char* text, long max, long& value)
 {
+    if (text == nullptr)
+        return false;
     char* end = nullptr;
     errno = 0;
     const long v = std::strtol(text, &end, 10);
