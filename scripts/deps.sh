@@ -5,6 +5,7 @@ VEXO_PACKAGES=(
     cmake make g++ googletest
     g++-powerpc-linux-gnu qemu-user
     util-linux mount procps groff-base
+    clang libclang-rt-14-dev cppcheck clang-tidy
 )
 
 vexo_install_deps() {

@@ -1,8 +1,10 @@
 #!/bin/bash
 # Runs every test: installs the Debian packages that are missing, builds the
 # native build with ASan and UBSan and the PowerPC cross build, and runs the
-# whole suite of both (the PowerPC one under qemu-ppc). Needs root.
-# The last line is "N passed, N failed" over both builds.
+# whole suite of both (the PowerPC one under qemu-ppc), then the fuzz targets
+# for a few seconds each and the static analysis. Needs root.
+# The last line is "N passed, N failed" over both builds, the fuzz targets and
+# the two static analysers.
 set -uo pipefail
 cd "$(dirname "$0")/.."
 # shellcheck source=scripts/deps.sh
@@ -34,6 +36,24 @@ for preset in asan ppc; do
     all=$(sed -E 's/.* failed out of ([0-9]+).*/\1/' <<<"$summary")
     total_pass=$((total_pass + all - failed))
     total_fail=$((total_fail + failed))
+done
+
+# Fuzzing (a few seconds per target, fixed seed) and static analysis; each
+# ends with "NAME: N passed, N failed", counted with the tests above.
+for step in "fuzz/run.sh --quick" "scripts/lint.sh"; do
+    log=$(mktemp)
+    # shellcheck disable=SC2086
+    bash $step 2>&1 | tee "$log"
+    [ "${PIPESTATUS[0]}" -eq 0 ] || status=1
+    summary=$(grep -E '^[a-z]+: [0-9]+ passed, [0-9]+ failed$' "$log" | tail -n 1)
+    rm -f "$log"
+    if [ -z "$summary" ]; then
+        total_fail=$((total_fail + 1))
+        status=1
+        continue
+    fi
+    total_pass=$((total_pass + $(sed -E 's/.*: ([0-9]+) passed.*/\1/' <<<"$summary")))
+    total_fail=$((total_fail + $(sed -E 's/.* ([0-9]+) failed$/\1/' <<<"$summary")))
 done
 echo "${total_pass} passed, ${total_fail} failed"
 exit "$status"
