@@ -3,7 +3,6 @@
 #include <fcntl.h>
 #include <poll.h>
 #include <sys/socket.h>
-#include <sys/un.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -14,6 +13,7 @@
 #include <gtest/gtest.h>
 
 #include "harness.hpp"
+#include "unix_client.hpp"
 
 namespace vt {
 
@@ -36,13 +36,9 @@ bool AudioCommand::ZeroFrom(std::size_t from) const
 AudioPeer::AudioPeer(Mode mode, int delayMs) : mode_(mode), delayMs_(delayMs)
 {
     RequireSandbox();
-    unlink("/tmp/vexoaudiod.sock");
-    listen_ = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    sockaddr_un addr {};
-    addr.sun_family = AF_UNIX;
-    std::strcpy(addr.sun_path, "/tmp/vexoaudiod.sock");  // fixed, fits
-    if (listen_ < 0 || bind(listen_, reinterpret_cast<sockaddr*>(&addr), sizeof addr) != 0 ||
-        listen(listen_, 4) != 0 || pipe2(stopPipe_, O_CLOEXEC) != 0) {
+    // A short queue of four, so that StopAccepting fills it after a few connects.
+    listen_ = BindUnix("/tmp/vexoaudiod.sock");
+    if (listen_ < 0 || listen(listen_, 4) != 0 || pipe2(stopPipe_, O_CLOEXEC) != 0) {
         ADD_FAILURE() << "audio peer: " << std::strerror(errno);
         return;
     }
@@ -123,24 +119,13 @@ void AudioPeer::Serve(int fd)
     // A client that gave up has closed its end: the answer must fail with
     // EPIPE, never raise SIGPIPE (under the emulator, as the sandbox's pid 1,
     // that signal hangs the whole test instead of being ignored).
-    switch (mode) {
-    case Mode::Answer:
-    case Mode::StopAccepting:
-        (void)!send(fd, "k", 1, MSG_NOSIGNAL);
-        break;
-    case Mode::AnswerLate:
+    if (mode == Mode::AnswerLate)
         std::this_thread::sleep_for(std::chrono::milliseconds(delayMs));
+    if (mode == Mode::Answer || mode == Mode::AnswerLate || mode == Mode::StopAccepting) {
         (void)!send(fd, "k", 1, MSG_NOSIGNAL);
-        break;
-    case Mode::NeverAnswer:
-        break;
-    case Mode::CloseWithoutAnswer:
-        break;
-    case Mode::AnswerHuge: {
+    } else if (mode == Mode::AnswerHuge) {
         static const std::vector<char> big(3 * 8192, 'h');
         (void)!send(fd, big.data(), big.size(), MSG_NOSIGNAL | MSG_DONTWAIT);
-        break;
-    }
     }
     if (mode == Mode::NeverAnswer)
         held_.push_back(fd);

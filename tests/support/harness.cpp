@@ -7,7 +7,6 @@
 #include <sys/prctl.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
-#include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -18,6 +17,8 @@
 #include <sstream>
 
 #include <gtest/gtest.h>
+
+#include "unix_client.hpp"
 
 namespace vt {
 
@@ -45,6 +46,19 @@ void BecomeSubreaper()
     }
 }
 
+// Milliseconds from now until end, or 0 once it has passed.
+int MsLeft(std::chrono::steady_clock::time_point end)
+{
+    const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(
+        end - std::chrono::steady_clock::now()).count();
+    return left > 0 ? static_cast<int>(left) : 0;
+}
+
+std::chrono::steady_clock::time_point Deadline(int timeoutMs)
+{
+    return std::chrono::steady_clock::now() + std::chrono::milliseconds(timeoutMs);
+}
+
 }  // namespace
 
 void RequireSandbox()
@@ -63,11 +77,11 @@ std::string BinPath(const std::string& program)
 
 bool WaitUntil(const std::function<bool()>& cond, int timeoutMs)
 {
-    const auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(timeoutMs);
+    const auto end = Deadline(timeoutMs);
     for (;;) {
         if (cond())
             return true;
-        if (std::chrono::steady_clock::now() >= end)
+        if (MsLeft(end) == 0)
             return false;
         std::this_thread::sleep_for(std::chrono::milliseconds(5));
     }
@@ -93,25 +107,23 @@ void WriteFile(const std::string& path, const std::string& content)
     out << content;
 }
 
+void MakeParentDirs(const std::string& path)
+{
+    for (size_t slash = path.find('/', 1); slash != std::string::npos; slash = path.find('/', slash + 1))
+        mkdir(path.substr(0, slash).c_str(), 0755);
+}
+
 // ---- SyslogSink ------------------------------------------------------------
 
 SyslogSink::SyslogSink()
 {
     RequireSandbox();
-    unlink("/dev/log");
-    fd_ = socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0);
-    sockaddr_un addr {};
-    addr.sun_family = AF_UNIX;
-    std::strcpy(addr.sun_path, "/dev/log");  // fixed, fits
-    if (fd_ < 0 || bind(fd_, reinterpret_cast<sockaddr*>(&addr), sizeof addr) != 0) {
+    fd_ = BindUnix("/dev/log", SOCK_DGRAM);
+    if (fd_ < 0 || pipe2(stopPipe_, O_CLOEXEC) != 0) {
         ADD_FAILURE() << "cannot bind /dev/log: " << std::strerror(errno);
         return;
     }
     chmod("/dev/log", 0666);
-    if (pipe2(stopPipe_, O_CLOEXEC) != 0) {
-        ADD_FAILURE() << "pipe: " << std::strerror(errno);
-        return;
-    }
     reader_ = std::thread([this] { Run(); });
 }
 
@@ -278,7 +290,7 @@ bool Process::Fill(int timeoutMs)
 
 bool Process::ReadLine(std::string& line, int timeoutMs)
 {
-    const auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(timeoutMs);
+    const auto end = Deadline(timeoutMs);
     for (;;) {
         const size_t nl = buffer_.find('\n');
         if (nl != std::string::npos) {
@@ -287,23 +299,19 @@ bool Process::ReadLine(std::string& line, int timeoutMs)
             seen_ += line + "\n";
             return true;
         }
-        const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(
-            end - std::chrono::steady_clock::now()).count();
-        if (left <= 0)
-            return false;
-        if (!Fill(static_cast<int>(left)) && out_ < 0)
+        const int left = MsLeft(end);
+        if (left == 0 || (!Fill(left) && out_ < 0))
             return false;
     }
 }
 
 bool Process::WaitForOutput(const std::string& needle, int timeoutMs)
 {
-    const auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(timeoutMs);
+    const auto end = Deadline(timeoutMs);
     std::string line;
     for (;;) {
-        const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(
-            end - std::chrono::steady_clock::now()).count();
-        if (left <= 0 || !ReadLine(line, static_cast<int>(left)))
+        const int left = MsLeft(end);
+        if (left == 0 || !ReadLine(line, left))
             return false;
         if (line.find(needle) != std::string::npos)
             return true;
@@ -354,21 +362,32 @@ int Process::Wait(int timeoutMs)
     return exitStatus_;
 }
 
-int RunToEnd(const std::vector<std::string>& argv, std::string* out, int timeoutMs)
+namespace {
+
+int RunAll(const std::vector<std::string>& argv, std::string* out, int timeoutMs, bool mergeStderr)
 {
-    Process p = Process::Start(argv);
-    const auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(timeoutMs);
+    Process p = Process::Start(argv, mergeStderr);
+    const auto end = Deadline(timeoutMs);
     // Drain the output while waiting, so that a chatty program never blocks.
-    while (p.Running() && std::chrono::steady_clock::now() < end) {
-        std::string line;
+    for (std::string line; p.Running() && MsLeft(end) > 0;)
         p.ReadLine(line, 50);
-    }
     const int status = p.Wait(0);
     if (out != nullptr)
         *out = p.Output();
-    if (status < 0 || !WIFEXITED(status))
-        return -1;
-    return WEXITSTATUS(status);
+    return status >= 0 && WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+}
+
+}  // namespace
+
+int RunToEnd(const std::vector<std::string>& argv, std::string* out, int timeoutMs)
+{
+    return RunAll(argv, out, timeoutMs, false);
+}
+
+int Vexorctl(std::vector<std::string> args, std::string* out)
+{
+    args.insert(args.begin(), BinPath("vexorctl"));
+    return RunAll(args, out, 30000, true);
 }
 
 // ---- Daemon ------------------------------------------------------------------
@@ -419,43 +438,22 @@ pid_t FindAdoptedChild(pid_t exclude)
 
 }  // namespace
 
-namespace {
-
-// One probe: connect, send action 0, wait for the daemon to hang up.
-bool ProbeOnce(int timeoutMs)
-{
-    const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    if (fd < 0)
-        return false;
-    sockaddr_un addr {};
-    addr.sun_family = AF_UNIX;
-    std::strcpy(addr.sun_path, "/tmp/vexoctrl");  // fixed, fits
-    bool served = false;
-    if (connect(fd, reinterpret_cast<sockaddr*>(&addr), sizeof addr) == 0) {
-        const std::int32_t nothing = 0;
-        if (write(fd, &nothing, sizeof nothing) == sizeof nothing) {
-            pollfd pfd {fd, POLLIN, 0};
-            char c;
-            served = poll(&pfd, 1, timeoutMs) == 1 && read(fd, &c, 1) == 0;
-        }
-    }
-    close(fd);
-    return served;
-}
-
-}  // namespace
-
 bool ProbeControlSocket(int timeoutMs)
 {
     // A file left at the path by an earlier run refuses connections until
-    // the daemon has replaced it: try again until the time is up.
-    const auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(timeoutMs);
+    // the daemon has replaced it: try again until the time is up. One probe:
+    // connect, send action 0, wait for the daemon to hang up.
+    const auto end = Deadline(timeoutMs);
     for (;;) {
-        const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(
-            end - std::chrono::steady_clock::now()).count();
-        if (left <= 0)
+        const int left = MsLeft(end);
+        if (left == 0)
             return false;
-        if (ProbeOnce(static_cast<int>(left)))
+        const int fd = SendAction(0);
+        char c;
+        const bool served = fd >= 0 && Readable(fd, left) && read(fd, &c, 1) == 0;
+        if (fd >= 0)
+            close(fd);
+        if (served)
             return true;
         std::this_thread::sleep_for(std::chrono::milliseconds(20));
     }

@@ -28,6 +28,8 @@ bool WaitUntil(const std::function<bool()>& cond, int timeoutMs);
 bool PathExists(const std::string& path);
 std::string ReadFile(const std::string& path);
 void WriteFile(const std::string& path, const std::string& content);
+// Makes every directory that leads to path ("/a/b" for "/a/b/file").
+void MakeParentDirs(const std::string& path);
 
 // A syslog daemon of our own: binds a datagram socket at /dev/log and keeps
 // the text of every message (the part after "ident: ").
@@ -96,6 +98,10 @@ private:
 // Runs a program to its end and returns its exit code (or -1); output in *out.
 int RunToEnd(const std::vector<std::string>& argv, std::string* out = nullptr,
              int timeoutMs = 20000);
+
+// Runs vexorctl with args to its end and returns its exit code (or -1); its
+// standard output and error together in *out.
+int Vexorctl(std::vector<std::string> args, std::string* out = nullptr);
 
 // Sends action 0 (nothing to do) on "/tmp/vexoctrl" and waits until the
 // daemon has read it and closed the connection: proof that its loop runs.
