@@ -35,22 +35,4 @@ TEST(Dispatch, EveryActionSendsItsCommandOnce)
     EXPECT_TRUE(log.Lines().empty()) << log.Dump();
 }
 
-TEST(Dispatch, WithoutAudioDaemonACommandFailsAndIsLogged)
-{
-    vt::SyslogSink log;
-    EXPECT_EQ(RcDispatchAction(RC_ACT_PLAY), -1);
-    EXPECT_EQ(RcDispatchAction(RC_ACT_RELEASED), 0);  // nothing to send, nothing fails
-    ASSERT_TRUE(log.WaitFor("ctrl.cpp:27 Failed to connect to /tmp/vexoaudiod.sock."));
-    EXPECT_EQ(log.Lines().size(), 1u) << log.Dump();
-}
-
-TEST(Dispatch, ActionNamesCoverExactlyTheCodes)
-{
-    EXPECT_STREQ(RcActionName(RC_ACT_NONE), "RC_ACT_NONE");
-    EXPECT_STREQ(RcActionName(13), "RC_ACT_TOGGLE_SHUFFLE");
-    EXPECT_STREQ(RcActionName(25), "RC_ACT_CUSTOM4_HELD");
-    EXPECT_EQ(RcActionName(26), nullptr);
-    EXPECT_EQ(RcActionName(-1), nullptr);
-}
-
 }  // namespace
