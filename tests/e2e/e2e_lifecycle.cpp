@@ -1,6 +1,5 @@
 // The daemon's lifecycle, run as the real binary in the sandbox.
 #include <signal.h>
-#include <sys/stat.h>
 
 #include <gtest/gtest.h>
 
@@ -44,18 +43,20 @@ TEST(Lifecycle, RunsWritesPidFileAndStopsCleanlyOnTermAndInt)
     EXPECT_TRUE(log.Lines().empty()) << log.Dump();
 }
 
-TEST(Lifecycle, RefusesToStartBesideALiveInstance)
+TEST(Lifecycle, RefusesToStartBesideALiveInstanceAndIgnoresSigpipe)
 {
     vt::SyslogSink log;
     vt::Daemon d;
     const pid_t pid = d.Start();
     ASSERT_GT(pid, 0);
+    d.Signal(SIGPIPE);
     std::string out;
     EXPECT_EQ(vt::RunToEnd({vt::BinPath("vexorcd")}, &out), 0);
     EXPECT_EQ(out, "vexorcd already exists. pid[" + std::to_string(pid) + "]\n");
     EXPECT_EQ(vt::ReadFile(kPidFile), std::to_string(pid));
     EXPECT_TRUE(d.Alive());
     EXPECT_EQ(d.Stop(), 0);
+    EXPECT_TRUE(log.Lines().empty()) << log.Dump();
 }
 
 TEST(Lifecycle, StaleOrGarbagePidFileIsIgnoredAndRewritten)
@@ -71,38 +72,6 @@ TEST(Lifecycle, StaleOrGarbagePidFileIsIgnoredAndRewritten)
         EXPECT_EQ(d.Stop(), 0);
     }
     EXPECT_TRUE(log.Lines().empty()) << log.Dump();
-}
-
-TEST(Lifecycle, UnwritablePidFileIsLoggedAndTheDaemonRunsOn)
-{
-    vt::SyslogSink log;
-    // A directory at the pid file's path cannot be opened for writing, not even by root.
-    unlink(kPidFile);
-    ASSERT_EQ(mkdir(kPidFile, 0755), 0);
-    vt::Daemon d;
-    ASSERT_GT(d.Start(true, false), 0);
-    ASSERT_TRUE(log.WaitFor("Failed to write vexorcd pid"));
-    const auto lines = log.Lines();
-    ASSERT_EQ(lines.size(), 1u) << log.Dump();
-    EXPECT_EQ(lines[0].rfind("vexorcd.cpp (119) Failed to write vexorcd pid [/var/run/vexorcd.pid]. (", 0), 0u)
-        << lines[0];
-    EXPECT_NE(lines[0].find("Is a directory)"), std::string::npos) << lines[0];
-    EXPECT_TRUE(d.Alive());
-    // At shutdown the removal of the missing pid file is harmless.
-    EXPECT_EQ(d.Stop(), 0);
-    EXPECT_EQ(log.Lines().size(), 1u) << log.Dump();
-    rmdir(kPidFile);
-}
-
-TEST(Lifecycle, IgnoresSigpipe)
-{
-    vt::SyslogSink log;
-    vt::Daemon d;
-    ASSERT_GT(d.Start(), 0);
-    d.Signal(SIGPIPE);
-    usleep(200000);
-    EXPECT_TRUE(d.Alive());
-    EXPECT_EQ(d.Stop(), 0);
 }
 
 }  // namespace

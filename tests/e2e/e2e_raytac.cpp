@@ -136,17 +136,4 @@ TEST_F(Raytac, SignalsCloseAndReopenTheReceiverAndAHeldVolumeKeyDoesNotRunAway)
     EXPECT_EQ(codes.back(), AUDIO_CMD_STOP);
 }
 
-TEST_F(Raytac, AFrozenMediaCenterDoesNotFreezeTheDaemon)
-{
-    vt::Process mc = vt::Process::Start({vt::BinPath("standin-mediacenter"), "--frozen"});
-    ASSERT_TRUE(mc.WaitForOutput("frozen /tmp/MediaCenter.sock"));
-    // Its queue takes a few keys; after that each key is not delivered and
-    // the daemon acts on it itself.
-    ASSERT_EQ(Sim({"press", "Volume Plus"}), 0) << last_;
-    EXPECT_TRUE(audio_.WaitForCount(1, 15000));
-    ASSERT_EQ(Sim({"release", "Volume Plus"}), 0) << last_;
-    // A daemon stuck in a send would never see SIGTERM.
-    EXPECT_EQ(daemon_.Stop(SIGTERM, 5000), 0);
-}
-
 }  // namespace
