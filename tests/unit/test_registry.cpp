@@ -55,6 +55,14 @@ TEST_F(Registry, OpenAndCloseWalkEveryDriverAndReportAnyFailure)
                                                "b.open", "a.close", "b.close"}));
     EXPECT_EQ(RcDriversOpenAll(empty), 0);
     EXPECT_EQ(RcDriversPoll(empty), 0);
+
+    // The product's table: the receiver first, whose wait paces the loop.
+    char text[64] = {};
+    std::FILE* f = fmemopen(text, sizeof text, "w");
+    ASSERT_NE(f, nullptr);
+    RcDriversList(f);
+    std::fclose(f);
+    EXPECT_STREQ(text, "Supported drivers:\n\traytac\n\tvexoctrl\n");
 }
 
 TEST_F(Registry, PollReturnsTheFirstPositiveResultInTableOrder)
