@@ -131,11 +131,7 @@ std::int32_t AirclickRead()
         return -1;
 
     for (;;) {
-        fd_set readable;
-        FD_ZERO(&readable);
-        FD_SET(fd, &readable);
-        timeval wait {0, AIRCLICK_WAIT_US};
-        if (select(fd + 1, &readable, nullptr, nullptr, &wait) <= 0)
+        if (!HiddevWaitReadable(fd, AIRCLICK_WAIT_US))
             return 0;
 
         unsigned char report[AIRCLICK_READ_MAX];

@@ -139,13 +139,8 @@ std::int32_t RaytacRead()
         return -1;
 
     RaytacEvent event {};
-    fd_set readable;
-    FD_ZERO(&readable);
-    FD_SET(fd, &readable);
-    timeval wait {};
-    wait.tv_usec = RAYTAC_WAIT_US;
     // A time-out, and a wait cut short by a signal, are both idle waits.
-    if (select(fd + 1, &readable, nullptr, nullptr, &wait) <= 0) {
+    if (!HiddevWaitReadable(fd, RAYTAC_WAIT_US)) {
         event.idle = true;
     } else {
         unsigned char report[RAYTAC_READ_MAX];
@@ -200,6 +195,15 @@ void HiddevPrint(std::FILE* out, const std::int32_t* version, const hiddev_devin
                  info->num_applications == 1 ? "" : "s");
     std::fprintf(out, "and is on bus: %d devnum: %d ifnum: %d\n", static_cast<int>(info->busnum),
                  static_cast<int>(info->devnum), static_cast<int>(info->ifnum));
+}
+
+bool HiddevWaitReadable(std::int32_t descriptor, long timeoutUs)
+{
+    fd_set readable;
+    FD_ZERO(&readable);
+    FD_SET(descriptor, &readable);
+    timeval wait {0, timeoutUs};
+    return select(descriptor + 1, &readable, nullptr, nullptr, &wait) > 0;
 }
 
 void HiddevDescribe(std::int32_t descriptor)

@@ -105,5 +105,9 @@ std::int32_t RaytacClose();
 // Prints the identification of an open hiddev device to standard output.
 void HiddevDescribe(std::int32_t descriptor);
 
+// Waits up to timeoutUs for a hiddev descriptor (below FD_SETSIZE) to become
+// readable; false on time-out, or when a signal or an error ends the wait.
+bool HiddevWaitReadable(std::int32_t descriptor, long timeoutUs);
+
 // Prints what HiddevDescribe found; a null pointer marks a request that failed.
 void HiddevPrint(std::FILE* out, const std::int32_t* version, const hiddev_devinfo* info);
