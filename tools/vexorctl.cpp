@@ -26,7 +26,7 @@
 #include "audioctl/ctrl.hpp"
 #include "audioctl/playlist.hpp"
 #include "common/rc_types.hpp"
-#include "vexorcd/dispatch.hpp"
+#include "common/actions.hpp"
 #include "vlibc/audioconf.hpp"
 
 namespace {

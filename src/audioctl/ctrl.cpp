@@ -14,6 +14,7 @@
 
 #include "audioctl/playlist.hpp"
 #include "common/log.hpp"
+#include "common/socket.hpp"
 #include "vlibc/audioconf.hpp"
 #include "vlibc/vlibc.hpp"
 
@@ -104,10 +105,9 @@ int ConnectBounded(int fd)
     limit.tv_usec = static_cast<suseconds_t>(AUDIO_BUDGET_US % 1000000);
     if (setsockopt(fd, SOL_SOCKET, SO_SNDTIMEO, &limit, sizeof limit) != 0)
         return -1;
-    sockaddr_un addr {};
-    addr.sun_family = AF_UNIX;
-    std::memcpy(addr.sun_path, AUDIO_SOCKET_PATH, sizeof AUDIO_SOCKET_PATH);
-    return connect(fd, reinterpret_cast<const sockaddr*>(&addr), sizeof addr);
+    sockaddr_un addr;
+    SocketFillAddress(addr, AUDIO_SOCKET_PATH);
+    return connect(fd, reinterpret_cast<const sockaddr*>(&addr), SOCKET_ADDRESS_LENGTH);
 }
 
 // Everything after the connect: both waits share one budget.

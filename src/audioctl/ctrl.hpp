@@ -10,8 +10,7 @@
 #include <cstddef>
 #include <cstdint>
 
-// Where the audio daemon listens.
-inline constexpr char AUDIO_SOCKET_PATH[] = "/tmp/vexoaudiod.sock";
+#include "common/paths.hpp"
 
 // Size of the argument area of a command record, and of every reply buffer
 // the client offers.
@@ -101,11 +100,6 @@ std::int32_t AudioCtrlSendBare(std::int32_t code);
 std::int32_t AudioCtrlSendInt(std::int32_t code, std::int32_t n);
 
 // ---- Equalizer profile --------------------------------------------------
-
-// The profile files, searched in this order.
-inline constexpr char AUDIO_EQ_SYSTEM_FILE[] =
-    "/var/packages/Sonarium/target/etc/equalizer.system";
-inline constexpr char AUDIO_EQ_USER_FILE[] = "/var/packages/Sonarium/etc/equalizer.user";
 
 // The audio configuration keys of the equalizer.
 inline constexpr char AUDIO_CONF_EQ_ENABLE[] = "audio_enable_equalizer";

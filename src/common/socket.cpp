@@ -20,11 +20,17 @@ static_assert(sizeof(sockaddr_un::sun_path) == 108);
 
 namespace {
 
-constexpr socklen_t ADDRESS_LENGTH = sizeof(sockaddr_un);
+// Closes fd without letting the close disturb the errno being reported.
+void CloseKeepingErrno(int fd)
+{
+    const int saved = errno;
+    close(fd);
+    errno = saved;
+}
 
-// Fills addr with the family and path, zeroing every other byte. False, with
-// nothing copied, when the path does not fit with its terminating zero.
-bool FillAddress(sockaddr_un& addr, const char* path)
+}  // namespace
+
+bool SocketFillAddress(sockaddr_un& addr, const char* path)
 {
     std::memset(&addr, 0, sizeof addr);
     addr.sun_family = AF_UNIX;
@@ -37,22 +43,12 @@ bool FillAddress(sockaddr_un& addr, const char* path)
     return true;
 }
 
-// Closes fd without letting the close disturb the errno being reported.
-void CloseKeepingErrno(int fd)
-{
-    const int saved = errno;
-    close(fd);
-    errno = saved;
-}
-
-}  // namespace
-
 std::int32_t SocketListenUnix(const char* path, std::int32_t backlog)
 {
     sockaddr_un addr;
     // A path that does not fit could only be bound truncated, elsewhere: refuse
     // it before anything is created or removed.
-    if (!FillAddress(addr, path)) {
+    if (!SocketFillAddress(addr, path)) {
         errno = ENAMETOOLONG;
         LogError(__FILE_NAME__, 45, "Failed to bind socket. (%s)", std::strerror(errno));
         return -1;
@@ -67,7 +63,7 @@ std::int32_t SocketListenUnix(const char* path, std::int32_t backlog)
     // A socket file left by an earlier run would make the bind fail.
     unlink(path);
 
-    if (bind(fd, reinterpret_cast<const sockaddr*>(&addr), ADDRESS_LENGTH) == -1) {
+    if (bind(fd, reinterpret_cast<const sockaddr*>(&addr), SOCKET_ADDRESS_LENGTH) == -1) {
         LogError(__FILE_NAME__, 45, "Failed to bind socket. (%s)", std::strerror(errno));
         CloseKeepingErrno(fd);
         return -1;
@@ -111,7 +107,7 @@ std::int32_t SocketAcceptClient(std::int32_t listenFd, std::int32_t* slots, std:
         return 0;
 
     sockaddr_un peer;
-    socklen_t peerLength = ADDRESS_LENGTH;
+    socklen_t peerLength = SOCKET_ADDRESS_LENGTH;
     const int client = accept(listenFd, reinterpret_cast<sockaddr*>(&peer), &peerLength);
     if (client == -1) {
         LogError(__FILE_NAME__, 114, "Failed to accept client. (%s)", std::strerror(errno));
@@ -137,7 +133,7 @@ std::int32_t SocketAcceptClient(std::int32_t listenFd, std::int32_t* slots, std:
 std::int32_t MediaCenterSendKey(std::uint32_t code)
 {
     sockaddr_un addr;
-    FillAddress(addr, MEDIA_CENTER_SOCKET_PATH);
+    SocketFillAddress(addr, MEDIA_CENTER_SOCKET_PATH);
 
     const int fd = socket(AF_UNIX, SOCK_DGRAM, 0);
     if (fd < 0)
@@ -147,7 +143,7 @@ std::int32_t MediaCenterSendKey(std::uint32_t code)
     // whole daemon. A full queue means "not delivered"; the daemon then acts
     // on the key itself.
     const ssize_t sent = sendto(fd, &code, sizeof code, MSG_DONTWAIT,
-                                reinterpret_cast<const sockaddr*>(&addr), ADDRESS_LENGTH);
+                                reinterpret_cast<const sockaddr*>(&addr), SOCKET_ADDRESS_LENGTH);
     close(fd);
     return sent >= 0 ? 0 : -1;
 }

@@ -3,10 +3,19 @@
 // key datagram offered to a media-center user interface.
 #pragma once
 
+#include <sys/socket.h>
+#include <sys/un.h>
+
 #include <cstdint>
 
-// Where a media-center user interface binds its datagram socket.
-inline constexpr char MEDIA_CENTER_SOCKET_PATH[] = "/tmp/MediaCenter.sock";
+#include "common/paths.hpp"
+
+// The length every address is handed over with: family and the whole path.
+inline constexpr socklen_t SOCKET_ADDRESS_LENGTH = sizeof(sockaddr_un);
+
+// Fills addr with the family and path, zeroing every other byte. False, with
+// nothing copied, when the path is null or does not fit with its terminating zero.
+bool SocketFillAddress(sockaddr_un& addr, const char* path);
 
 // Marks a free entry of a slot table.
 inline constexpr std::int32_t SOCKET_SLOT_FREE = -1;

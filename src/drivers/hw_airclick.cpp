@@ -10,9 +10,10 @@
 #include <cstring>
 
 #include "common/log.hpp"
-#include "drivers/hw_raytac.hpp"
+#include "common/paths.hpp"
+#include "drivers/hiddev.hpp"
 
-RcDriver airclick = {"airclick", "/dev/usb/hiddev1", -1, AirclickOpen, AirclickRead, AirclickClose};
+RcDriver airclick = {"airclick", RC_AIRCLICK_DEVICE_PATH, -1, AirclickOpen, AirclickRead, AirclickClose};
 
 const RcKeyEntry AirclickKeyMap[] = {
     {0xFA, RC_ACT_PLAY, "Play"},

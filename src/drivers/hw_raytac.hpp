@@ -7,13 +7,11 @@
 // the fourth idle wait in a row); the volume keys repeat on every idle wait.
 #pragma once
 
-#include <linux/hiddev.h>
-
 #include <cstddef>
 #include <cstdint>
-#include <cstdio>
 
 #include "common/rc_types.hpp"
+#include "drivers/hiddev.hpp"
 
 // The driver record, first in the registry; SIGUSR1/SIGUSR2 open and close it.
 extern RcDriver raytac;
@@ -30,8 +28,6 @@ struct RaytacReport {
     hiddev_event events[9];
 };
 inline constexpr int RAYTAC_KEY_EVENT = 8;
-static_assert(sizeof(hiddev_event) == 8);
-static_assert(offsetof(hiddev_event, hid) == 0 && offsetof(hiddev_event, value) == 4);
 static_assert(sizeof(RaytacReport) == 72);
 static_assert(offsetof(RaytacReport, events) + RAYTAC_KEY_EVENT * sizeof(hiddev_event) == 64);
 
@@ -65,28 +61,6 @@ struct RaytacHandOver {
     std::uint32_t code;
 };
 
-// Next and Previous.
-constexpr bool RcActionIsNextPrev(RcAction a) { return a == RC_ACT_NEXT || a == RC_ACT_PREV; }
-
-// Custom 1 to 4.
-constexpr bool RcActionIsCustom(RcAction a) { return a >= RC_ACT_CUSTOM1 && a <= RC_ACT_CUSTOM4; }
-
-// The six actions that have a held variant.
-constexpr bool RcActionHasLongPress(RcAction a) { return RcActionIsNextPrev(a) || RcActionIsCustom(a); }
-
-// Volume Plus and Volume Minus, which repeat while held.
-constexpr bool RcActionIsVolume(RcAction a)
-{
-    return a == RC_ACT_VOLUME_UP || a == RC_ACT_VOLUME_DOWN;
-}
-
-// The held variant of a long-press action (7 -> 20, 8 -> 21, 16..19 -> 22..25).
-constexpr RcAction RcActionHeldVariant(RcAction a)
-{
-    return RcActionIsNextPrev(a) ? a + (RC_ACT_NEXT_HELD - RC_ACT_NEXT)
-                                 : a + (RC_ACT_CUSTOM1_HELD - RC_ACT_CUSTOM1);
-}
-
 // The first key-map entry with this usage, or nullptr.
 const RcKeyEntry* RaytacKeyFind(std::uint32_t usage);
 
@@ -101,13 +75,3 @@ std::int32_t RaytacRead();
 
 // Closes the receiver if it is open; 0.
 std::int32_t RaytacClose();
-
-// Prints the identification of an open hiddev device to standard output.
-void HiddevDescribe(std::int32_t descriptor);
-
-// Waits up to timeoutUs for a hiddev descriptor (below FD_SETSIZE) to become
-// readable; false on time-out, or when a signal or an error ends the wait.
-bool HiddevWaitReadable(std::int32_t descriptor, long timeoutUs);
-
-// Prints what HiddevDescribe found; a null pointer marks a request that failed.
-void HiddevPrint(std::FILE* out, const std::int32_t* version, const hiddev_devinfo* info);

@@ -7,9 +7,10 @@
 #include <cstring>
 
 #include "common/log.hpp"
+#include "common/paths.hpp"
 #include "common/socket.hpp"
 
-RcDriver vexoctrl = {"vexoctrl", "/tmp/vexoctrl", -1, CtrlSockOpen, CtrlSockRead, CtrlSockClose};
+RcDriver vexoctrl = {"vexoctrl", RC_CTRL_SOCKET_PATH, -1, CtrlSockOpen, CtrlSockRead, CtrlSockClose};
 
 std::int32_t CtrlSockClients[CTRL_SOCK_SLOTS] = {-1, -1, -1, -1};
 

@@ -3,10 +3,8 @@
 
 #include <csignal>
 
+#include "common/paths.hpp"
 #include "common/rc_types.hpp"
-
-// Where the daemon records its pid: decimal, no newline.
-inline constexpr char RC_PID_FILE[] = "/var/run/vexorcd.pid";
 
 // Pause at the top of every loop turn, in microseconds.
 inline constexpr unsigned RC_LOOP_PAUSE_US = 100;

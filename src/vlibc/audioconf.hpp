@@ -16,8 +16,7 @@
 // - When several lines set one key, the last of them counts.
 #pragma once
 
-// Where the store lives.
-inline constexpr char VEXO_AUDIO_CONF_PATH[] = "/var/lib/vexora/audio.conf";
+#include "common/paths.hpp"
 
 // Size of the buffer a value is read into by the audio client: a value has at
 // most 1023 characters.

@@ -1,0 +1,23 @@
+// What the two hiddev drivers share: the kernel's event record, the wait for
+// a report, and the identification lines printed when a device opens.
+#pragma once
+
+#include <linux/hiddev.h>
+
+#include <cstddef>
+#include <cstdint>
+#include <cstdio>
+
+// The kernel's event record: usage, then value, in the machine's byte order.
+static_assert(sizeof(hiddev_event) == 8);
+static_assert(offsetof(hiddev_event, hid) == 0 && offsetof(hiddev_event, value) == 4);
+
+// Prints the identification of an open hiddev device to standard output.
+void HiddevDescribe(std::int32_t descriptor);
+
+// Waits up to timeoutUs for a hiddev descriptor (below FD_SETSIZE) to become
+// readable; false on time-out, or when a signal or an error ends the wait.
+bool HiddevWaitReadable(std::int32_t descriptor, long timeoutUs);
+
+// Prints what HiddevDescribe found; a null pointer marks a request that failed.
+void HiddevPrint(std::FILE* out, const std::int32_t* version, const hiddev_devinfo* info);
