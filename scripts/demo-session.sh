@@ -25,11 +25,11 @@ trap cleanup EXIT
 syslog-sink >"$work/syslog" 2>&1 & pids+=($!)
 standin-audiod >"$work/audio" 2>&1 & pids+=($!)
 seen_audio=0 seen_media=0 seen_log=0
-show() {  # show FILE VAR PREFIX: prints the lines of FILE not shown yet
-    local file=$1 var=$2 prefix=$3 n
+show() {  # show FILE VAR PREFIX [FILTER]: prints the lines of FILE not shown yet
+    local file=$1 var=$2 prefix=$3 filter=${4:-cat} n
     n=$(wc -l <"$file")
     if [ "$n" -gt "${!var}" ]; then
-        tail -n +"$((${!var} + 1))" "$file" | head -n "$((n - ${!var}))" | sed "s/^/$prefix/"
+        tail -n +"$((${!var} + 1))" "$file" | head -n "$((n - ${!var}))" | "$filter" | sed "s/^/$prefix/"
         printf -v "$var" '%s' "$n"
     fi
 }
@@ -41,15 +41,34 @@ settle() {  # waits until nothing new has arrived for a moment, then shows it al
         last=$now
         sleep 0.35
     done
+    local before=$seen_audio
     show "$work/audio" seen_audio "      audio daemon got: "
-    [ -f "$work/media" ] && show "$work/media" seen_media "      media center got: "
+    [ -f "$work/media" ] && show "$work/media" seen_media "      media center got: " name_keys
+    [ "${1:-}" = media ] && [ "$seen_audio" = "$before" ] &&
+        echo "      (the audio daemon got nothing: the key was left to the media center)"
     show "$work/syslog" seen_log   "      syslog:           "
+}
+# Adds the key's label to each "key 0x..." line, from the remote's own key list.
+name_keys() {
+    local line code label
+    while IFS= read -r line; do
+        code=${line##*key }
+        label=$(remote-sim keys | awk -v c="$code" '$1 == c { $1 = ""; sub(/^ +/, ""); print; exit }')
+        echo "$line${label:+ ($label)}"
+    done
 }
 step() { echo; echo "== $*"; }
 remote() { remote-sim --drain-ms 3000 "$@" >/dev/null || echo "      (remote-sim failed)"; }
 for _ in $(seq 100); do [ -S /tmp/vexoaudiod.sock ] && [ -S /dev/log ] && break; sleep 0.1; done
 seen_audio=$(wc -l <"$work/audio")
 seen_log=$(wc -l <"$work/syslog")
+
+if [ -n "${VEXO_EMULATOR:-}" ]; then
+    # Bytes 4 and 5 of an ELF header: the class (1: 32-bit) and the byte order (2: big-endian).
+    elf=$(od -An -tu1 -j4 -N2 "$bin/vexorcd" | tr -s ' ')
+    [ "$elf" = " 1 2" ] && kind="32-bit big-endian" || kind="unexpected ELF class/data:$elf"
+    echo "The programs below are the PowerPC build ($kind), each run under ${VEXO_EMULATOR%% *}."
+fi
 
 step "The receiver is plugged in (a FIFO stands at /dev/usb/hiddev5); vexorcd starts"
 mkfifo /dev/usb/hiddev5
@@ -82,7 +101,7 @@ step "The media-center UI starts and takes the keys"
 standin-mediacenter >"$work/media" 2>&1 & media=$!; pids+=($media)
 for _ in $(seq 100); do [ -S /tmp/MediaCenter.sock ] && break; sleep 0.1; done
 seen_media=$(wc -l <"$work/media")
-remote tap Play; settle
+remote tap Play; settle media
 step "The media-center UI goes away; the daemon acts on the keys again"
 kill "$media"; wait "$media" 2>/dev/null
 remote tap Play; settle
@@ -101,7 +120,10 @@ kill -USR1 "$daemon"; sleep 0.5
 remote tap Play; settle
 
 if [ "${VEXO_DEMO_SHELL:-0}" = 1 ]; then
-    cat <<MSG
+    if [ -t 0 ]; then
+        # The sandbox's fresh /dev has no terminal node; the shell needs one.
+        [ -e /dev/tty ] || mknod -m 666 /dev/tty c 5 0
+        cat <<MSG
 
 == A shell in the sandbox. vexorcd (pid $daemon) and the stand-ins still run.
    Try: vexorctl play            vexorctl --list
@@ -111,8 +133,22 @@ if [ "${VEXO_DEMO_SHELL:-0}" = 1 ]; then
         kill -USR2 $daemon / kill -USR1 $daemon   (unplug / replug)
    Leave with exit; everything stops and nothing is left behind.
 MSG
-    bash -i </dev/tty || true
-    seen_audio=$(wc -l <"$work/audio") seen_log=$(wc -l <"$work/syslog")
+        # What the user's last command returned is theirs; a shell that
+        # could not run at all is the demo's failure.
+        PS1='(vexo sandbox) \$ ' bash --norc -i
+        [ $? -lt 126 ] || { echo "demo: the shell could not run" >&2; exit 1; }
+        seen_audio=$(wc -l <"$work/audio") seen_log=$(wc -l <"$work/syslog")
+    else
+        # No terminal: each line of standard input is a command, run in turn
+        # with what the peers got after it.
+        step "Commands from standard input (vexorcd is pid $daemon)"
+        while IFS= read -r line; do
+            [ -n "$line" ] || continue
+            echo "\$ $line"
+            bash -c "$line" </dev/null
+            settle
+        done
+    fi
 fi
 
 step "SIGTERM: vexorcd stops, removes its pid file and control socket"

@@ -6,7 +6,9 @@
 #   bash scripts/demo.sh           the session on the native build
 #   bash scripts/demo.sh --ppc     the same on the PowerPC build, under qemu-ppc
 #   bash scripts/demo.sh --shell   the session, then a shell in the sandbox to
-#                                  drive the daemon by hand (exit leaves it)
+#                                  drive the daemon by hand (exit leaves it);
+#                                  without a terminal, each line of standard
+#                                  input is run as a command instead
 set -euo pipefail
 cd "$(dirname "$0")/.."
 preset=release
@@ -15,7 +17,7 @@ for arg in "$@"; do
     case "$arg" in
     --ppc) preset=ppc ;;
     --shell) shell=1 ;;
-    -h|--help) sed -n '2,10p' "$0" | sed 's/^# \{0,1\}//'; exit 0 ;;
+    -h|--help) sed -n '2,/^[^#]/{/^#/s/^# \{0,1\}//p}' "$0"; exit 0 ;;
     *) echo "demo.sh: unknown option $arg (try --help)" >&2; exit 2 ;;
     esac
 done
