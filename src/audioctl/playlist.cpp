@@ -1,12 +1,18 @@
 #include "audioctl/playlist.hpp"
 
+#include <cstdint>
 #include <cstring>
 
 #include "common/log.hpp"
 
+std::int32_t AudioPlaylistIntMin(std::int32_t code)
+{
+    return code == AUDIO_CMD_21 ? 0 : INT32_MIN;
+}
+
 std::int32_t AudioPlaylistCheckInt(std::int32_t code, std::int32_t n)
 {
-    if (code == AUDIO_CMD_21 && n < 0) {
+    if (n < AudioPlaylistIntMin(code)) {
         LogClientError(__FILE_NAME__, 55, "Bad parameter");
         return -1;
     }

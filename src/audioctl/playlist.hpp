@@ -42,6 +42,10 @@ std::int32_t AudioCtrlSendRecord(std::int32_t code, const AudioPlaylistRecord* r
 std::int32_t AudioCtrlSendRecordInt(std::int32_t code, std::int32_t n,
                                     AudioPlaylistRecord* record);
 
+// The least decimal argument a command takes: 0 for AUDIO_CMD_21, INT32_MIN
+// (no limit) for every other command.
+std::int32_t AudioPlaylistIntMin(std::int32_t code);
+
 // Applies the refusal of the decimal playlist commands: logs and returns -1
-// when code does not take n (a negative n for AUDIO_CMD_21), else 0.
+// when code does not take n (n below AudioPlaylistIntMin), else 0.
 std::int32_t AudioPlaylistCheckInt(std::int32_t code, std::int32_t n);

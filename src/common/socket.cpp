@@ -121,12 +121,15 @@ std::int32_t SocketAcceptClient(std::int32_t listenFd, std::int32_t* slots, std:
         LogError(__FILE_NAME__, 114, "Failed to accept client. (%s)", std::strerror(errno));
         return -1;
     }
-    slots[freeSlot] = client;
-
+    // Clients are handed over non-blocking: one that cannot be made so is
+    // closed and refused like a failed accept, not kept as it came.
     const int flags = fcntl(client, F_GETFL);
-    if (flags == -1)
-        return 0;
-    fcntl(client, F_SETFL, flags | O_NONBLOCK);
+    if (flags == -1 || fcntl(client, F_SETFL, flags | O_NONBLOCK) == -1) {
+        CloseKeepingErrno(client);
+        LogError(__FILE_NAME__, 114, "Failed to accept client. (%s)", std::strerror(errno));
+        return -1;
+    }
+    slots[freeSlot] = client;
     return 0;
 }
 

@@ -25,7 +25,8 @@ inline constexpr std::int32_t SOCKET_SLOT_FREE = -1;
 std::int32_t SocketListenUnix(const char* path, std::int32_t backlog);
 
 // Accepts at most one waiting connection into the lowest free slot, as a
-// non-blocking socket, without ever waiting; 0, or -1 (logged) if accept failed.
+// non-blocking socket, without ever waiting; 0, or -1 (logged) if accept failed
+// or the client could not be made non-blocking (it is closed, its slot stays free).
 std::int32_t SocketAcceptClient(std::int32_t listenFd, std::int32_t* slots, std::int32_t slotCount);
 
 // Offers a key code as one 4-byte native-order datagram to the media-center

@@ -5,15 +5,8 @@
 
 namespace {
 
-// What an action sends: a command code (0 for nothing) and, for the custom
-// keys, the decimal argument 1..4 (0 for a command without argument).
-struct ActionCommand {
-    std::int32_t code;
-    std::int32_t arg;
-};
-
 // Indexed by the action code.
-constexpr ActionCommand ACTION_COMMANDS[] = {
+constexpr RcActionCommand ACTION_COMMANDS[] = {
     {0, 0},                          // RC_ACT_NONE: never dispatched
     {0, 0},                          // RC_ACT_UNMAPPED
     {AUDIO_CMD_STOP, 0},             // RC_ACT_STOP
@@ -45,11 +38,14 @@ static_assert(sizeof ACTION_COMMANDS / sizeof ACTION_COMMANDS[0] == RC_ACT_LAST 
 
 }  // namespace
 
+RcActionCommand RcDispatchCommandOf(RcAction action)
+{
+    return RcActionIsDispatchable(action) ? ACTION_COMMANDS[action] : RcActionCommand {0, 0};
+}
+
 std::int32_t RcDispatchAction(RcAction action)
 {
-    if (!RcActionIsDispatchable(action))
-        return 0;
-    const ActionCommand& command = ACTION_COMMANDS[action];
+    const RcActionCommand command = RcDispatchCommandOf(action);
     if (command.code == 0)
         return 0;
     if (command.arg == 0)
