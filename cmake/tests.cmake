@@ -40,11 +40,7 @@ foreach(src ${E2E_TESTS})
   vexo_add_test(e2e ${src})
   get_filename_component(name ${src} NAME_WE)
   # End-to-end tests start the daemon and the tools: build them first.
-  add_dependencies(${name} vexorcd)
-  foreach(tool ${TOOL_SOURCES})
-    get_filename_component(toolname ${tool} NAME_WE)
-    add_dependencies(${name} ${toolname})
-  endforeach()
+  add_dependencies(${name} vexorcd ${VEXO_TOOLS})
 endforeach()
 
 file(GLOB SCRIPT_TESTS CONFIGURE_DEPENDS tests/scripts/test_*.sh)

@@ -30,7 +30,7 @@ cppcheck_all() {
     local platform rc=0
     for platform in unix64 unix32; do
         cppcheck --enable=warning,performance,portability --error-exitcode=1 --std=c++20 \
-            --inline-suppr --quiet --platform="$platform" -I src src tools || rc=1
+            --inline-suppr --quiet --platform="$platform" -I src -I tools src tools || rc=1
     done
     return "$rc"
 }
@@ -41,7 +41,7 @@ clang_tidy_all() {
         -DCMAKE_EXPORT_COMPILE_COMMANDS=ON >"$build.log" 2>&1 || { cat "$build.log"; return 1; }
     rm -f "$build.log"
     local files
-    mapfile -t files < <(ls src/*/*.cpp tools/*.cpp)
+    mapfile -t files < <(ls src/*/*.cpp tools/*.cpp tools/*/*.cpp)
     printf '%s\n' "${files[@]}" |
         xargs -P 2 -n 4 clang-tidy -p "$build" --quiet 2>&1 |
         grep -vE '^[0-9]+ warnings? (and [0-9]+ errors? )?generated\.$|^Suppressed [0-9]+ warnings|^Use -header-filter|^Error while processing' |

@@ -10,11 +10,8 @@
 // report; it also waits so after the last one before it exits.
 //
 // Run "remote-sim --help" for the script language.
-#include <fcntl.h>
+#include <poll.h>
 #include <signal.h>
-#include <sys/ioctl.h>
-#include <sys/stat.h>
-#include <unistd.h>
 
 #include <cctype>
 #include <cerrno>
@@ -27,7 +24,9 @@
 #include <thread>
 #include <vector>
 
-#include "drivers/hw_raytac.hpp"
+#include "common/paths.hpp"
+#include "lib/quit.hpp"
+#include "lib/receiver_fifo.hpp"
 
 namespace {
 
@@ -138,17 +137,6 @@ void ListKeys()
         std::printf("alias %s = %s\n", a.name, a.label);
 }
 
-// One report: the eight events before the key stand for the keyboard's
-// modifier usages (Left Control .. Right GUI), none pressed.
-RaytacReport MakeReport(std::uint32_t usage, std::int32_t value)
-{
-    RaytacReport r {};
-    for (int i = 0; i < RAYTAC_KEY_EVENT; ++i)
-        r.events[i] = hiddev_event {0x000700E0u + static_cast<unsigned>(i), 0};
-    r.events[RAYTAC_KEY_EVENT] = hiddev_event {usage, value};
-    return r;
-}
-
 // Parses the script; false (with a message) on the first bad word.
 bool ParseScript(const std::vector<std::string>& words, std::vector<Step>& steps)
 {
@@ -212,143 +200,88 @@ bool ParseScript(const std::vector<std::string>& words, std::vector<Step>& steps
     return true;
 }
 
-class Fifo {
-public:
-    explicit Fifo(int drainMs) : drainMs_(drainMs) {}
-    ~Fifo()
-    {
-        if (fd_ >= 0)
-            close(fd_);
-    }
-
-    // Makes or takes the FIFO and opens its writer without waiting for a reader.
-    bool Open(const std::string& path)
-    {
-        struct stat st {};
-        if (stat(path.c_str(), &st) != 0) {
-            if (mkfifo(path.c_str(), 0644) != 0) {
-                std::fprintf(stderr, "remote-sim: mkfifo %s: %s\n", path.c_str(), std::strerror(errno));
-                return false;
-            }
-        } else if (!S_ISFIFO(st.st_mode)) {
-            std::fprintf(stderr, "remote-sim: %s exists and is not a FIFO\n", path.c_str());
-            return false;
-        }
-        // A writer can only be opened without waiting while a reader exists:
-        // hold one of our own for that moment.
-        const int reader = open(path.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC);
-        if (reader >= 0)
-            fd_ = open(path.c_str(), O_WRONLY | O_NONBLOCK | O_CLOEXEC);
-        const int openErrno = errno;
-        if (reader >= 0)
-            close(reader);
-        if (fd_ < 0) {
-            std::fprintf(stderr, "remote-sim: open %s: %s\n", path.c_str(), std::strerror(openErrno));
-            return false;
-        }
+// Writes bytes in one piece after the previous write has been read, and
+// says so on standard output (or why not on standard error).
+bool Write(const ReceiverFifo& fifo, const void* bytes, std::size_t size, const std::string& what)
+{
+    const long n = fifo.Write(bytes, size);
+    if (n == static_cast<long>(size)) {
+        std::printf("sent %s\n", what.c_str());
+        std::fflush(stdout);
         return true;
     }
+    std::fprintf(stderr, "remote-sim: %s not written: %s\n", what.c_str(),
+                 n < 0 ? (errno == EPIPE ? "nobody reads the device" : std::strerror(errno))
+                       : "cut short");
+    return false;
+}
 
-    // Waits until the reader has taken everything written, at most drainMs.
-    void Drain() const
-    {
-        const auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(drainMs_);
-        for (;;) {
-            int queued = 0;
-            if (ioctl(fd_, FIONREAD, &queued) != 0 || queued == 0)
-                return;
-            if (std::chrono::steady_clock::now() >= end)
-                return;
-            std::this_thread::sleep_for(std::chrono::milliseconds(1));
-        }
-    }
-
-    // Writes bytes in one piece after the previous write has been read.
-    bool Write(const void* bytes, std::size_t size, const std::string& what)
-    {
-        Drain();
-        const ssize_t n = write(fd_, bytes, size);
-        if (n == static_cast<ssize_t>(size)) {
-            std::printf("sent %s\n", what.c_str());
-            std::fflush(stdout);
-            return true;
-        }
-        std::fprintf(stderr, "remote-sim: %s not written: %s\n", what.c_str(),
-                     n < 0 ? (errno == EPIPE ? "nobody reads the device" : std::strerror(errno))
-                           : "cut short");
-        return false;
-    }
-
-    bool Report(std::uint32_t usage, std::int32_t value)
-    {
-        const RaytacReport r = MakeReport(usage, value);
-        const char* verb = value == RAYTAC_PRESSED ? "press" : value == 0 ? "release" : "event";
-        std::string what = std::string(verb) + " " + KeyName(usage);
-        if (value != RAYTAC_PRESSED && value != 0)
-            what += " value " + std::to_string(value);
-        return Write(&r, sizeof r, what);
-    }
-
-private:
-    int fd_ = -1;
-    int drainMs_;
-};
+bool Report(const ReceiverFifo& fifo, std::uint32_t usage, std::int32_t value)
+{
+    const RaytacReport r = ReceiverReport(usage, value);
+    const char* verb = value == RAYTAC_PRESSED ? "press" : value == 0 ? "release" : "event";
+    std::string what = std::string(verb) + " " + KeyName(usage);
+    if (value != RAYTAC_PRESSED && value != 0)
+        what += " value " + std::to_string(value);
+    return Write(fifo, &r, sizeof r, what);
+}
 
 void SleepMs(std::int32_t ms) { std::this_thread::sleep_for(std::chrono::milliseconds(ms)); }
 
-bool Run(Fifo& fifo, const Step& s)
+bool Run(const ReceiverFifo& fifo, const Step& s)
 {
     switch (s.op) {
     case Op::Event:
-        return fifo.Report(s.usage, s.value);
+        return Report(fifo, s.usage, s.value);
     case Op::Tap: {
-        const bool pressed = fifo.Report(s.usage, RAYTAC_PRESSED);
-        return fifo.Report(s.usage, 0) && pressed;
+        const bool pressed = Report(fifo, s.usage, RAYTAC_PRESSED);
+        return Report(fifo, s.usage, 0) && pressed;
     }
     case Op::Hold: {
-        const bool pressed = fifo.Report(s.usage, RAYTAC_PRESSED);
+        const bool pressed = Report(fifo, s.usage, RAYTAC_PRESSED);
         SleepMs(s.value);
-        return fifo.Report(s.usage, 0) && pressed;
+        return Report(fifo, s.usage, 0) && pressed;
     }
     case Op::Sleep:
         SleepMs(s.value);
         return true;
     case Op::Raw: {
-        const RaytacReport r = MakeReport(s.usage, RAYTAC_PRESSED);
+        const RaytacReport r = ReceiverReport(s.usage, RAYTAC_PRESSED);
         std::vector<unsigned char> bytes(static_cast<std::size_t>(s.value));
         for (std::size_t i = 0; i < bytes.size(); ++i)
             bytes[i] = reinterpret_cast<const unsigned char*>(&r)[i % sizeof r];
-        return fifo.Write(bytes.data(), bytes.size(),
-                          "raw " + std::to_string(s.value) + " bytes of " + KeyName(s.usage));
+        return Write(fifo, bytes.data(), bytes.size(),
+                     "raw " + std::to_string(s.value) + " bytes of " + KeyName(s.usage));
     }
     }
     return false;
 }
 
 // Keeps the writer open until SIGTERM or SIGINT, which end the program normally.
-void Stay()
+bool Stay()
 {
-    sigset_t quit;
-    sigemptyset(&quit);
-    for (const int sig : {SIGTERM, SIGINT})
-        sigaddset(&quit, sig);
-    sigprocmask(SIG_BLOCK, &quit, nullptr);
-    int received = 0;
-    sigwait(&quit, &received);
+    if (!QuitInstall()) {
+        std::fprintf(stderr, "remote-sim: signals: %s\n", std::strerror(errno));
+        return false;
+    }
+    pollfd quit {QuitFd(), POLLIN, 0};
+    while (poll(&quit, 1, -1) != 1)
+        continue;
+    return true;
 }
 
 }  // namespace
 
 int main(int argc, char** argv)
 {
-    std::string device = raytac.devicePath;
+    std::string device = RC_RAYTAC_DEVICE_PATH;
     bool stay = false;
     long long drainMs = 5000;
     std::vector<std::string> words;
     for (int i = 1; i < argc; ++i) {
         const std::string arg = argv[i];
         if (arg == "--help" || arg == "-h") {
-            std::printf(USAGE, argv[0], raytac.devicePath);
+            std::printf(USAGE, argv[0], RC_RAYTAC_DEVICE_PATH);
             return 0;
         }
         if (arg == "keys") {
@@ -361,7 +294,7 @@ int main(int argc, char** argv)
             device = argv[++i];
         } else if (arg == "--drain-ms" && i + 1 < argc) {
             if (!ParseNumber(argv[++i], 0, 600000, drainMs)) {
-                std::fprintf(stderr, USAGE, argv[0], raytac.devicePath);
+                std::fprintf(stderr, USAGE, argv[0], RC_RAYTAC_DEVICE_PATH);
                 return 2;
             }
         } else {
@@ -370,15 +303,18 @@ int main(int argc, char** argv)
     }
     std::vector<Step> steps;
     if (!ParseScript(words, steps)) {
-        std::fprintf(stderr, USAGE, argv[0], raytac.devicePath);
+        std::fprintf(stderr, USAGE, argv[0], RC_RAYTAC_DEVICE_PATH);
         return 2;
     }
 
     // A reader that goes away makes writes fail with EPIPE, not kill us.
     signal(SIGPIPE, SIG_IGN);
-    Fifo fifo(static_cast<int>(drainMs));
-    if (!fifo.Open(device))
+    ReceiverFifo fifo(static_cast<int>(drainMs));
+    std::string error;
+    if (!fifo.Open(device, &error)) {
+        std::fprintf(stderr, "remote-sim: %s\n", error.c_str());
         return 1;
+    }
     std::printf("ready %s\n", device.c_str());
     std::fflush(stdout);
 
@@ -386,7 +322,7 @@ int main(int argc, char** argv)
     for (const Step& s : steps)
         ok = Run(fifo, s) && ok;
     fifo.Drain();
-    if (stay)
-        Stay();
+    if (stay && !Stay())
+        return 1;
     return ok ? 0 : 1;
 }
