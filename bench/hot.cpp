@@ -9,20 +9,16 @@
 //   vexohot describe NAME  what the figure measures
 //   vexohot toggles NAME   the functions whose entry and exit toggle collection
 //   vexohot run NAME       runs the loop once
-#include <poll.h>
-#include <sys/socket.h>
-#include <sys/un.h>
-#include <unistd.h>
-
+#include <cerrno>
 #include <cstdint>
 #include <cstdio>
 #include <cstring>
 #include <string>
-#include <thread>
 
 #include "audioctl/ctrl.hpp"
 #include "audioctl/playlist.hpp"
 #include "drivers/hw_raytac.hpp"
+#include "lib/audio_peer.hpp"
 
 namespace {
 
@@ -44,36 +40,14 @@ RaytacEvent Key(std::uint32_t usage, std::int32_t value)
     return e;
 }
 
-// Answers every record with one byte, on its own thread, until the process ends.
+// The tools' stand-in audio daemon, answering every record on its own thread
+// until the process ends.
 void StartAudioPeer()
 {
-    unlink(AUDIO_SOCKET_PATH);
-    const int fd = socket(AF_UNIX, SOCK_STREAM, 0);
-    sockaddr_un addr {};
-    addr.sun_family = AF_UNIX;
-    std::memcpy(addr.sun_path, AUDIO_SOCKET_PATH, sizeof AUDIO_SOCKET_PATH);
-    if (fd < 0 || bind(fd, reinterpret_cast<sockaddr*>(&addr), sizeof addr) != 0 ||
-        listen(fd, 8) != 0) {
-        std::perror("vexohot: audio peer");
-        return;
-    }
-    std::thread([fd] {
-        static char rec[8196];
-        for (;;) {
-            const int c = accept(fd, nullptr, nullptr);
-            if (c < 0)
-                continue;
-            std::size_t got = 0;
-            while (got < sizeof rec) {
-                const ssize_t r = read(c, rec + got, sizeof rec - got);
-                if (r <= 0)
-                    break;
-                got += static_cast<std::size_t>(r);
-            }
-            (void)!write(c, "k", 1);
-            close(c);
-        }
-    }).detach();
+    static AudioPeer peer;
+    std::string error;
+    if (!peer.Listen(&error) || !peer.Start())
+        std::fprintf(stderr, "vexohot: audio peer: %s\n", error.empty() ? std::strerror(errno) : error.c_str());
 }
 
 // Twenty profiles, the one asked for last.

@@ -29,18 +29,23 @@ cleanup() {
 }
 trap cleanup EXIT
 
-"$bin/vexobench" sink /tmp/syslog.txt &
+# The daemon's built-in paths: pid_file, ctrl_socket, receiver, syslog_socket.
+eval "$("$bin/vexobench" paths)"
+
+# The tools' stand-in logger; its first line says that it listens.
+"$bin/syslog-sink" >>/tmp/syslog.txt 2>&1 &
 started+=($!)
-for _ in $(seq 100); do [ -S /dev/log ] && break; sleep 0.05; done
+for _ in $(seq 100); do [ -S "$syslog_socket" ] && break; sleep 0.05; done
+syslog_lines() { grep -vc '^syslog-sink: listening on' /tmp/syslog.txt; }
 
 # Starts the daemon (with the environment given as arguments) and prints its
-# pid once it serves "/tmp/vexoctrl".
+# pid once it serves its control socket.
 start_daemon() {
-    rm -f /var/run/vexorcd.pid
+    rm -f "$pid_file"
     env "$@" "$bin/vexorcd" || return 1
     local pid=""
     for _ in $(seq 200); do
-        [ -s /var/run/vexorcd.pid ] && [ -S /tmp/vexoctrl ] && pid=$(cat /var/run/vexorcd.pid) && break
+        [ -s "$pid_file" ] && [ -S "$ctrl_socket" ] && pid=$(cat "$pid_file") && break
         sleep 0.05
     done
     [ -n "$pid" ] || return 1
@@ -94,28 +99,29 @@ idle_figures() {
     emit "$label.turns_per_s" "$(awk -v d=$((s1 - s0)) -v s="$idle" -v k="$sleeps" 'BEGIN {printf "%.0f", d / k / s}')"
 }
 
-# The receiver as a FIFO with a writer held open: the daemon's wait on it
-# runs its whole 200 ms.
+# The receiver as a FIFO with a writer held open (remote-sim --stay): the
+# daemon's wait on it runs its whole 200 ms.
+remote=""
 receiver_open() {
-    rm -f /dev/usb/hiddev5
-    mkfifo /dev/usb/hiddev5
-    exec 7<>/dev/usb/hiddev5
-    kill -USR1 "$1"
+    rm -f "$receiver" /tmp/remote-sim.txt
+    "$bin/remote-sim" --stay >/tmp/remote-sim.txt 2>&1 &
+    remote=$!
+    started+=("$remote")
     for _ in $(seq 100); do
-        ls -l "/proc/$1/fd" 2>/dev/null | grep -q /dev/usb/hiddev5 && return 0
+        grep -q '^ready ' /tmp/remote-sim.txt && break
         sleep 0.05
     done
+    kill -USR1 "$1"
+    "$bin/vexobench" wait-open "$1" && return 0
     note "the daemon did not open the receiver"
     return 1
 }
 receiver_close() {
     kill -USR2 "$1"
-    for _ in $(seq 100); do
-        ls -l "/proc/$1/fd" 2>/dev/null | grep -q /dev/usb/hiddev5 || break
-        sleep 0.05
-    done
-    exec 7<&-
-    rm -f /dev/usb/hiddev5
+    "$bin/vexobench" wait-open "$1" closed
+    [ -z "$remote" ] || { kill -TERM "$remote"; wait "$remote"; }
+    remote=""
+    rm -f "$receiver"
 }
 
 # 1. The baseline: the same road without the daemon.
@@ -168,7 +174,7 @@ note "throughput ($senders senders x $per_sender actions)"
 
 emit memory.vmhwm_kb "$(awk '/^VmHWM/ {print $2}' "/proc/$pid/status")"
 emit memory.vmrss_kb "$(awk '/^VmRSS/ {print $2}' "/proc/$pid/status")"
-emit syslog.measured_runs "$(wc -l </tmp/syslog.txt)"
+emit syslog.measured_runs "$(syslog_lines)"
 stop_daemon "$pid"
 
 # 5. Heap allocations, over every road of the daemon.
@@ -180,7 +186,7 @@ started+=("$pid")
 "$bin/vexobench" exercise "$pid" >>"$out" || failed=1
 stop_daemon "$pid"
 sed 's/^/alloc./' /tmp/alloc.txt >>"$out"
-emit syslog.exercise "$(wc -l </tmp/syslog.txt)"
+emit syslog.exercise "$(syslog_lines)"
 if [ -s /tmp/alloc-trace.txt ]; then
     note "allocations after start-up:"
     cat /tmp/alloc-trace.txt >&2

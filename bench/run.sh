@@ -21,7 +21,7 @@ native=$root/build/bench-release
 ppc=$root/build/bench-ppc
 echo "=== build: native Release and PowerPC Release"
 cmake -S . -B "$native" -DCMAKE_BUILD_TYPE=Release -DVEXO_BENCH=ON -DVEXO_TESTS=OFF >/dev/null
-cmake --build "$native" -j2 --target vexorcd vexobench vexoalloc vexohot
+cmake --build "$native" -j2 --target vexorcd vexobench vexoalloc vexohot remote-sim syslog-sink
 cmake -S . -B "$ppc" --toolchain cmake/powerpc-linux-gnu.cmake -DCMAKE_BUILD_TYPE=Release \
     -DVEXO_TESTS=OFF >/dev/null
 cmake --build "$ppc" -j2 --target vexorcd
@@ -65,8 +65,8 @@ results=$(cat <<EOF
 
 Written by \`bash bench/run.sh\` (as root) on $(date -u '+%Y-%m-%d %H:%M UTC'), commit $commit.
 The daemon runs inside tests/sandbox.sh with its built-in paths; the load
-generator and the stand-in audio daemon are one process (bench/vexobench.cpp)
-with one monotonic clock. Run-time figures are of the native build; the
+generator and the stand-in audio daemon are one process (bench/vexobench.cpp,
+built on the tools' action sender and audio peer) with one monotonic clock. Run-time figures are of the native build; the
 PowerPC build is measured for size and run-time libraries.
 
 ## Machine and build
@@ -112,8 +112,9 @@ exercise of the failure roads: $(get syslog.exercise).
 - Latency is timed from the sender's connect to the last byte of the record
   at the audio daemon, each action sent at a random point of the loop turn
   (or of the receiver's wait). The baseline relay does the same two socket
-  exchanges with a blocking accept and no pause, so the ratio is what the
-  100 µs pause and the polling cost.
+  exchanges (the daemon's own dispatch and audio client) with a blocking
+  accept and no pause, so the ratio is what the 100 µs pause and the polling
+  cost.
 - The one system call per action above the design's twelve is the send
   time-out set on the audio socket: it bounds the connect, so that an audio
   daemon whose listen queue is full cannot stop the loop for ever.
