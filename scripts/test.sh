@@ -1,10 +1,11 @@
 #!/bin/bash
 # Runs every test: installs the Debian packages that are missing, builds the
 # native build with ASan and UBSan and the PowerPC cross build, and runs the
-# whole suite of both (the PowerPC one under qemu-ppc), then the fuzz targets
+# whole suite of both (the PowerPC one under qemu-ppc), then checks that the
+# optimised release preset builds (its warnings differ), then the fuzz targets
 # for a few seconds each and the static analysis. Needs root.
-# The last line is "N passed, N failed" over both builds, the fuzz targets and
-# the two static analysers.
+# The last line is "N passed, N failed" over both builds, the release build,
+# the fuzz targets and the two static analysers.
 set -uo pipefail
 cd "$(dirname "$0")/.."
 # shellcheck source=scripts/deps.sh
@@ -37,6 +38,17 @@ for preset in asan ppc; do
     total_pass=$((total_pass + all - failed))
     total_fail=$((total_fail + failed))
 done
+
+# The release preset: only built, as one step. g++ at -O3 warns where the
+# debug and cross builds do not, and warnings are errors.
+echo "=== release: configure and build"
+if cmake --preset release >/dev/null && cmake --build --preset release; then
+    total_pass=$((total_pass + 1))
+else
+    echo "build release failed"
+    status=1
+    total_fail=$((total_fail + 1))
+fi
 
 # Fuzzing (a few seconds per target, fixed seed) and static analysis; each
 # ends with "NAME: N passed, N failed", counted with the tests above.

@@ -386,7 +386,7 @@ int RunToEnd(const std::vector<std::string>& argv, std::string* out, int timeout
 
 int Vexorctl(std::vector<std::string> args, std::string* out)
 {
-    args.insert(args.begin(), BinPath("vexorctl"));
+    args.insert(args.begin(), {BinPath("vexorctl")});
     return RunAll(args, out, 30000, true);
 }
 
