@@ -2,7 +2,7 @@
 // delivers it, the command catalogue and the equalizer profile.
 //
 // Every command travels as one fixed 8196-byte record on its own connection to
-// "/tmp/vexoaudiod.sock"; the audio daemon answers with at least one byte.
+// the audio daemon's socket (AUDIO_SOCKET_PATH); it answers with at least one byte.
 // The two waits of an exchange (for writability, then for the reply) share
 // one budget of 500 ms; the connect is bounded by the same 500 ms.
 #pragma once

@@ -5,7 +5,7 @@
 //   LogError(__FILE_NAME__, 304, "Got short read from device!")
 //     -> "hw_raytac.cpp (304) Got short read from device!"
 //   LogClientError(__FILE_NAME__, 27, "Failed to connect to %s. [%s]", ...)
-//     -> "ctrl.cpp:27 Failed to connect to /tmp/vexoaudiod.sock. [...]"
+//     -> "ctrl.cpp:27 Failed to connect to <the audio socket>. [...]"
 #pragma once
 
 // Longest message text after the prefix; longer texts are cut, never overrun.

@@ -1,5 +1,5 @@
 // AirClick remote driver: five buttons and a release report, read through
-// the hiddev device "/dev/usb/hiddev1". Each press counts once; a held
+// its hiddev device (RC_AIRCLICK_DEVICE_PATH). Each press counts once; a held
 // volume button repeats at most once per 200 ms.
 //
 // Complete but not registered: adding its record to RcDriverTable is all

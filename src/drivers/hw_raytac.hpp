@@ -1,5 +1,5 @@
 // Raytac radio receiver driver: the keys of a USB radio remote, reported as
-// HID keyboard usages through the hiddev device "/dev/usb/hiddev5".
+// HID keyboard usages through its hiddev device (RC_RAYTAC_DEVICE_PATH).
 //
 // Every key is first offered to a listening media-center interface; a key
 // whose datagram is delivered is left to it. Next, Previous and Custom 1 to 4

@@ -1,4 +1,4 @@
-// Control-socket driver: local programs inject actions on "/tmp/vexoctrl",
+// Control-socket driver: local programs inject actions on RC_CTRL_SOCKET_PATH,
 // one 4-byte action code in native byte order per connection.
 #pragma once
 

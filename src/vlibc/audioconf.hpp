@@ -1,6 +1,6 @@
 // Stand-in for the appliance's audio configuration store.
 //
-// The store is one text file, "/var/lib/vexora/audio.conf", of key=value lines:
+// The store is one text file, VEXO_AUDIO_CONF_PATH, of key=value lines:
 // - A line ends at a newline; the last line may lack one. A line holds at
 //   most 1023 characters before its newline.
 // - Lines without '=' (blank ones included) are ignored, and so are lines
