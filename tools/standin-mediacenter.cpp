@@ -22,14 +22,16 @@
 
 namespace {
 
-int Usage(const char* argv0)
+// The usage text: on standard output with status 0 when asked for, on
+// standard error with status 2 after a bad option.
+int Usage(const char* argv0, bool asked)
 {
-    std::fprintf(stderr,
-                 "usage: %s [--frozen] [--socket PATH]\n"
+    std::fprintf(asked ? stdout : stderr,
+                 "usage: %s [--frozen] [--socket PATH] [--help]\n"
                  "  Binds a datagram socket (default %s) and prints each key code\n"
                  "  received as \"key 0x%%08X\"; --frozen never reads from it.\n",
                  argv0, MEDIA_CENTER_SOCKET_PATH);
-    return 2;
+    return asked ? 0 : 2;
 }
 
 }  // namespace
@@ -45,7 +47,7 @@ int main(int argc, char** argv)
         else if (arg == "--socket" && i + 1 < argc)
             path = argv[++i];
         else
-            return Usage(argv[0]);
+            return Usage(argv[0], arg == "--help" || arg == "-h");
     }
     if (!QuitInstall()) {
         std::fprintf(stderr, "%s: signals: %s\n", argv[0], std::strerror(errno));

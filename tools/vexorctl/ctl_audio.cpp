@@ -160,7 +160,7 @@ int CtlAudioOutcome(std::int32_t code, std::int32_t result)
     const AudioCmdInfo* info = AudioCmdFind(code);
     const char* name = info != nullptr ? info->name : "?";
     if (result != 0) {
-        std::fprintf(stderr, "%s: %s (%" PRId32 "): the audio daemon did not take the command (see syslog)\n",
+        std::fprintf(stderr, "%s: %s (%" PRId32 "): the audio daemon did not take the command\n",
                      CTL_PROGRAM, name, code);
         return CTL_EXIT_FAILED;
     }
@@ -216,7 +216,7 @@ int CtlAudio(int argc, char** argv)
         // A refused argument is not an exchange that failed: tell them apart.
         if (AudioPlaylistCheckInt(cmd->code, n) != 0) {
             std::fprintf(stderr, "%s: %s (%" PRId32 "): the audio client refuses the argument %" PRId32
-                                 "; nothing was sent (see syslog)\n",
+                                 "; nothing was sent\n",
                          CTL_PROGRAM, cmd->name, cmd->code, n);
             return CTL_EXIT_FAILED;
         }

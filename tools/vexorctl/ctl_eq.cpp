@@ -71,15 +71,15 @@ void ExplainSearchFailure()
 {
     const char* head = "cannot search the equalizer profiles";
     if (!Openable(AUDIO_EQ_SYSTEM_FILE))
-        std::fprintf(stderr, "%s: %s: %s: %s (see syslog)\n", CTL_PROGRAM, head, AUDIO_EQ_SYSTEM_FILE,
+        std::fprintf(stderr, "%s: %s: %s: %s\n", CTL_PROGRAM, head, AUDIO_EQ_SYSTEM_FILE,
                      std::strerror(errno));
     else if (!Openable(AUDIO_EQ_USER_FILE))
         std::fprintf(stderr,
                      "%s: %s: %s: %s, and the profile is not in %s or that file holds a line "
-                     "without ':' (see syslog)\n",
+                     "without ':'\n",
                      CTL_PROGRAM, head, AUDIO_EQ_USER_FILE, std::strerror(errno), AUDIO_EQ_SYSTEM_FILE);
     else
-        std::fprintf(stderr, "%s: %s: a profile file holds a line without ':' (see syslog)\n", CTL_PROGRAM, head);
+        std::fprintf(stderr, "%s: %s: a profile file holds a line without ':'\n", CTL_PROGRAM, head);
 }
 
 // The default profile for `eq show` and `eq apply`, which take no arguments:

@@ -12,8 +12,10 @@
 #include <cstdint>
 #include <cstdio>
 #include <cstring>
+#include <syslog.h>
 
 #include "audioctl/playlist.hpp"
+#include "common/actions.hpp"
 #include "lib/action_send.hpp"
 #include "vexorctl/ctl_audio.hpp"
 #include "vexorctl/ctl_eq.hpp"
@@ -81,6 +83,10 @@ int CmdSend(int argc, char** argv)
     for (int i = 0; i < argc; ++i) {
         RcAction a = 0;
         CtlParseAction(argv[i], a);
+        // Sent as asked: a program may probe the socket with it. But say so.
+        if (!RcActionIsDispatchable(a))
+            std::fprintf(stderr, "%s: %s: not an action (1 to %d); vexorcd takes it and ignores it\n",
+                         CTL_PROGRAM, argv[i], static_cast<int>(RC_ACT_LAST));
         if (!SendOne(a, argv[i]))
             return CTL_EXIT_FAILED;
     }
@@ -234,6 +240,9 @@ int Run(int argc, char** argv)
 
 int main(int argc, char** argv)
 {
+    // The audio client logs its failures; whoever runs vexorctl sees them on
+    // standard error too, also on a machine without a system logger.
+    openlog(CTL_PROGRAM, LOG_PERROR, LOG_USER);
     int status = Run(argc, argv);
     // A script reading `eq show` must not take a cut value for the profile.
     if (std::fflush(stdout) != 0 || std::ferror(stdout) != 0) {
