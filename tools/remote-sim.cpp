@@ -9,9 +9,15 @@
 // reader has taken the previous one, so that every read sees exactly one
 // report; it also waits so after the last one before it exits.
 //
+// With --gadget PATH it drives a real receiver instead: a USB HID gadget
+// (Linux f_hid, /dev/hidgN) whose 2-byte report {modifiers, key} the host
+// reads through hiddev as nine events, the key's change in the ninth.
+//
 // Run "remote-sim --help" for the script language.
+#include <fcntl.h>
 #include <poll.h>
 #include <signal.h>
+#include <unistd.h>
 
 #include <cctype>
 #include <cerrno>
@@ -31,7 +37,7 @@
 namespace {
 
 const char USAGE[] =
-    "usage: %s [--device PATH] [--stay] [--drain-ms MS] STEP...\n"
+    "usage: %s [--device PATH | --gadget PATH] [--stay] [--drain-ms MS] STEP...\n"
     "Writes receiver key reports into a FIFO at PATH (default %s),\n"
     "making the FIFO if nothing stands there.\n"
     "Steps:\n"
@@ -50,11 +56,20 @@ const char USAGE[] =
     "Options:\n"
     "  --stay          keep the writer open after the script until SIGTERM/SIGINT\n"
     "  --drain-ms MS   longest wait for the reader before each report (default 5000)\n"
+    "  --gadget PATH   write 2-byte HID reports {0, key} to a USB HID gadget's device\n"
+    "                  (release: {0, 0}), 30 ms apart, instead of FIFO reports\n"
     "Prints \"ready PATH\" once the writer is open and one line per report written.\n"
     "Exit status: 0, 1 when a report could not be written, 2 on a usage error.\n";
 
 constexpr int RAW_SIZE_MAX = 4096;
 constexpr std::uint32_t PLAY_USAGE = 0x0007002C;
+// The gadget's report descriptor carries Keyboard-page keys 0x04 to 0x65.
+constexpr std::uint32_t GADGET_FIRST_KEY = 0x00070004;
+constexpr std::uint32_t GADGET_LAST_KEY = 0x00070065;
+constexpr int GADGET_GAP_MS = 30;
+
+// The USB HID gadget's device when --gadget names one, else -1.
+int gadgetFd = -1;
 
 struct Alias {
     const char* name;
@@ -204,7 +219,11 @@ bool ParseScript(const std::vector<std::string>& words, std::vector<Step>& steps
 // says so on standard output (or why not on standard error).
 bool Write(const ReceiverFifo& fifo, const void* bytes, std::size_t size, const std::string& what)
 {
-    const long n = fifo.Write(bytes, size);
+    // A gadget's reader cannot be seen from here: leave it a moment instead.
+    if (gadgetFd >= 0)
+        std::this_thread::sleep_for(std::chrono::milliseconds(GADGET_GAP_MS));
+    const long n = gadgetFd >= 0 ? static_cast<long>(write(gadgetFd, bytes, size))
+                                 : fifo.Write(bytes, size);
     if (n == static_cast<long>(size)) {
         std::printf("sent %s\n", what.c_str());
         std::fflush(stdout);
@@ -223,7 +242,14 @@ bool Report(const ReceiverFifo& fifo, std::uint32_t usage, std::int32_t value)
     std::string what = std::string(verb) + " " + KeyName(usage);
     if (value != RAYTAC_PRESSED && value != 0)
         what += " value " + std::to_string(value);
-    return Write(fifo, &r, sizeof r, what);
+    if (gadgetFd < 0)
+        return Write(fifo, &r, sizeof r, what);
+    if (usage < GADGET_FIRST_KEY || usage > GADGET_LAST_KEY) {
+        std::fprintf(stderr, "remote-sim: the gadget cannot send %s\n", KeyName(usage).c_str());
+        return false;
+    }
+    const unsigned char report[2] = {0, static_cast<unsigned char>(value == RAYTAC_PRESSED ? usage & 0xFF : 0)};
+    return Write(fifo, report, sizeof report, what);
 }
 
 void SleepMs(std::int32_t ms) { std::this_thread::sleep_for(std::chrono::milliseconds(ms)); }
@@ -246,6 +272,10 @@ bool Run(const ReceiverFifo& fifo, const Step& s)
         SleepMs(s.value);
         return true;
     case Op::Raw: {
+        if (gadgetFd >= 0) {
+            std::fprintf(stderr, "remote-sim: raw-size needs a FIFO\n");
+            return false;
+        }
         const RaytacReport r = ReceiverReport(s.usage, RAYTAC_PRESSED);
         std::vector<unsigned char> bytes(static_cast<std::size_t>(s.value));
         for (std::size_t i = 0; i < bytes.size(); ++i)
@@ -276,6 +306,7 @@ int main(int argc, char** argv)
 {
     std::string device = RC_RAYTAC_DEVICE_PATH;
     bool stay = false;
+    bool gadget = false;
     long long drainMs = 5000;
     std::vector<std::string> words;
     for (int i = 1; i < argc; ++i) {
@@ -290,7 +321,8 @@ int main(int argc, char** argv)
         }
         if (arg == "--stay") {
             stay = true;
-        } else if (arg == "--device" && i + 1 < argc) {
+        } else if ((arg == "--device" || arg == "--gadget") && i + 1 < argc) {
+            gadget = arg == "--gadget";
             device = argv[++i];
         } else if (arg == "--drain-ms" && i + 1 < argc) {
             if (!ParseNumber(argv[++i], 0, 600000, drainMs)) {
@@ -311,7 +343,12 @@ int main(int argc, char** argv)
     signal(SIGPIPE, SIG_IGN);
     ReceiverFifo fifo(static_cast<int>(drainMs));
     std::string error;
-    if (!fifo.Open(device, &error)) {
+    if (gadget) {
+        gadgetFd = open(device.c_str(), O_WRONLY | O_CLOEXEC);
+        if (gadgetFd < 0)
+            error = "open " + device + ": " + std::strerror(errno);
+    }
+    if (gadget ? gadgetFd < 0 : !fifo.Open(device, &error)) {
         std::fprintf(stderr, "remote-sim: %s\n", error.c_str());
         return 1;
     }
