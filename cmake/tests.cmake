@@ -64,3 +64,8 @@ foreach(src ${SOAK_TESTS})
   add_dependencies(${name} vexorcd)
   set_tests_properties(soak.${name} PROPERTIES ENVIRONMENT "VEXO_SOAK_SECONDS=40")
 endforeach()
+
+# The first process of the PowerPC machine that tests/kernel/run.sh boots.
+add_executable(kernel-init tests/kernel/init.cpp)
+target_link_libraries(kernel-init PRIVATE vexocore vexo_warnings)
+target_link_options(kernel-init PRIVATE -static-libstdc++ -static-libgcc)

@@ -7,6 +7,11 @@ VEXO_PACKAGES=(
     util-linux mount procps groff-base
     clang libclang-rt-14-dev cppcheck clang-tidy
 )
+# What tests/kernel/run.sh adds: a PowerPC kernel built from source, booted
+# under system emulation.
+VEXO_KERNEL_PACKAGES=(
+    linux-source-6.1 flex bison bc cpio xz-utils libssl-dev libelf-dev qemu-system-ppc
+)
 
 vexo_install_deps() {
     local missing=() p
