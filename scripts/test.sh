@@ -3,9 +3,10 @@
 # native build with ASan and UBSan and the PowerPC cross build, and runs the
 # whole suite of both (the PowerPC one under qemu-ppc), then checks that the
 # optimised release preset builds (its warnings differ), then the fuzz targets
-# for a few seconds each and the static analysis. Needs root.
+# for a few seconds each, the static analysis and the checks on a PowerPC
+# kernel (tests/kernel/run.sh). Needs root.
 # The last line is "N passed, N failed" over both builds, the release build,
-# the fuzz targets and the two static analysers.
+# the fuzz targets, the two static analysers and the kernel checks.
 set -uo pipefail
 cd "$(dirname "$0")/.."
 # shellcheck source=scripts/deps.sh
@@ -50,9 +51,11 @@ else
     total_fail=$((total_fail + 1))
 fi
 
-# Fuzzing (a few seconds per target, fixed seed) and static analysis; each
-# ends with "NAME: N passed, N failed", counted with the tests above.
-for step in "fuzz/run.sh --quick" "scripts/lint.sh"; do
+# Fuzzing (a few seconds per target, fixed seed), static analysis, and the
+# daemon on a PowerPC kernel under qemu-system-ppc (its kernel is built on
+# first use); each ends with "NAME: N passed, N failed", counted with the
+# tests above.
+for step in "fuzz/run.sh --quick" "scripts/lint.sh" "tests/kernel/run.sh"; do
     log=$(mktemp)
     # shellcheck disable=SC2086
     bash $step 2>&1 | tee "$log"
