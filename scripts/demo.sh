@@ -9,6 +9,9 @@
 #                                  drive the daemon by hand (exit leaves it);
 #                                  without a terminal, each line of standard
 #                                  input is run as a command instead
+#   bash scripts/demo.sh --kernel  a session on a real PowerPC kernel under
+#                                  qemu-system-ppc, the receiver a USB HID
+#                                  gadget (builds that kernel once, 5-14 min)
 set -euo pipefail
 cd "$(dirname "$0")/.."
 preset=release
@@ -17,6 +20,7 @@ for arg in "$@"; do
     case "$arg" in
     --ppc) preset=ppc ;;
     --shell) shell=1 ;;
+    --kernel) exec bash tests/kernel/run.sh --demo ;;
     -h|--help) sed -n '2,/^[^#]/{/^#/s/^# \{0,1\}//p}' "$0"; exit 0 ;;
     *) echo "demo.sh: unknown option $arg (try --help)" >&2; exit 2 ;;
     esac
