@@ -53,6 +53,8 @@ void Check(const std::string& name, bool ok, std::string detail = "")
 {
     ++(ok ? passed : failed);
     std::ranges::replace(detail, '\n', ' ');
+    while (detail.ends_with(' '))
+        detail.pop_back();
     std::printf("%s %s%s%s\n", ok ? "ok  " : "FAIL", name.c_str(), detail.empty() ? "" : ": ",
                 detail.c_str());
 }
@@ -242,7 +244,7 @@ void RunRow(const Row& row)
         WaitFor("/tmp/MediaCenter.sock", 5000);
     }
     if (demo)
-        std::printf("\n== %s\n      %-18s %s\n", row.name, "remote", row.script);
+        std::printf("\n== %s\n      %-18s %s\n", row.name, "input", row.script);
     const std::string script = row.script;
     Finish(Spawn(script.starts_with("vexorctl") ? "/bin/" + script
                                                 : "/bin/remote-sim --gadget /dev/hidg0 " + script,
