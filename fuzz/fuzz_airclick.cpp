@@ -114,7 +114,7 @@ void Reads(fz::Reader& in)
     // Once the reports are taken, the device reads as end of file: every
     // read then ends with -1 at once instead of waiting 200 ms.
     shutdown(pair[1], SHUT_WR);
-    // Each read takes one report or more; one more read than reports meets the end.
+    // Each read takes one report; one more read than reports meets the end.
     for (int calls = 0; calls <= packets; ++calls) {
         const std::int32_t r = AirclickRead();
         if (r < -1 || r > RC_ACT_VOLUME_DOWN || (r > 0 && r < RC_ACT_PLAY))

@@ -9,7 +9,8 @@
 //   0 idle wait
 //   1 k        press key k (k picks one of the 17 mapped keys, or an unmapped usage)
 //   2 k v      release of key k with event value v (never 1)
-//   3 n n data a raw report of n bytes (0 to 1023), taken as one read
+//   3 n n data a raw read of n bytes (0 to 1023): whole reports are each
+//              handled as if read alone, anything else is dropped
 //   4          a media-center interface appears, or goes
 #include <sys/socket.h>
 #include <sys/un.h>
@@ -100,6 +101,15 @@ struct Model {
         held = action;
         return Hand(ModelLong(action) ? 0 : action);
     }
+
+    // A read dropped whole may have held a release: no key is down any more.
+    RcAction Lost()
+    {
+        lastCode = 0;
+        idle = 0;
+        held = 0;
+        return -1;
+    }
 };
 
 // The device: a packet socket keeps each report one read, as hiddev does.
@@ -146,6 +156,17 @@ void Check(bool ok, const char* what)
 {
     if (!ok)
         fz::Fail(what);
+}
+
+// Checks one read (or idle step) against the model.
+void Verify(const Model& model, RcAction got, RcAction want)
+{
+    Check(got == want, "the read's result differs from the hold rules");
+    Check(got >= -1 && got <= RC_ACT_LAST, "a result outside the actions");
+    Check(RaytacHold.lastCode == model.lastCode && RaytacHold.idleCycles == model.idle &&
+              RaytacHold.heldAction == model.held,
+          "the hold state differs from the hold rules");
+    DrainMediaCenter(model.lastCode);
 }
 
 }  // namespace
@@ -202,29 +223,32 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
         } else if (op == 3) {
             std::size_t n = (static_cast<std::size_t>(in.Byte()) << 8 | in.Byte()) % 1024;
             const std::uint8_t* bytes = in.Take(n, &n);
-            // A datagram of more than the 512 bytes one read asks for is cut to 512.
-            const std::size_t seen = n < 512 ? n : 512;
+            // A datagram of more than the seven reports one read asks for is cut to them.
+            const std::size_t seen = n < 7 * 72 ? n : 7 * 72;
             got = ReadPacket(bytes, n);
-            if (seen == 72) {
-                std::uint32_t usage;
-                std::int32_t value;
-                std::memcpy(&usage, bytes + 64, 4);
-                std::memcpy(&value, bytes + 68, 4);
-                want = model.Key(usage, value);
+            if (seen == 0 || seen % 72 != 0) {
+                want = model.Lost();
             } else {
-                want = -1;  // dropped, with the state unchanged
+                // The first report is this read's; each of the others is the
+                // next read's, taken without waiting and without a new packet.
+                for (std::size_t r = 0; r < seen / 72; ++r) {
+                    std::uint32_t usage;
+                    std::int32_t value;
+                    std::memcpy(&usage, bytes + 72 * r + 64, 4);
+                    std::memcpy(&value, bytes + 72 * r + 68, 4);
+                    if (r > 0) {
+                        Verify(model, got, want);
+                        got = RaytacRead();
+                    }
+                    want = model.Key(usage, value);
+                }
             }
         } else {
             SetMediaCenter(mediaCenter < 0);
             model.mediaCenter = mediaCenter >= 0;
             continue;
         }
-        Check(got == want, "the read's result differs from the hold rules");
-        Check(got >= -1 && got <= RC_ACT_LAST, "a result outside the actions");
-        Check(RaytacHold.lastCode == model.lastCode && RaytacHold.idleCycles == model.idle &&
-                  RaytacHold.heldAction == model.held,
-              "the hold state differs from the hold rules");
-        DrainMediaCenter(model.lastCode);
+        Verify(model, got, want);
     }
     return 0;
 }

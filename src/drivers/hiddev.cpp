@@ -3,6 +3,10 @@
 #include <sys/ioctl.h>
 #include <sys/select.h>
 
+#include <cerrno>
+
+bool (*HiddevStopWaiting)() = nullptr;
+
 // The request numbers differ between architectures in their direction bits
 // (0x40 on PowerPC, 0x80 on x86); the record sizes are the same on both.
 static_assert(sizeof(hiddev_devinfo) == 28);
@@ -36,13 +40,23 @@ void HiddevPrint(std::FILE* out, const std::int32_t* version, const hiddev_devin
                  static_cast<int>(info->devnum), static_cast<int>(info->ifnum));
 }
 
-bool HiddevWaitReadable(std::int32_t descriptor, long timeoutUs)
+HiddevWait HiddevWaitReadable(std::int32_t descriptor, long timeoutUs)
 {
-    fd_set readable;
-    FD_ZERO(&readable);
-    FD_SET(descriptor, &readable);
-    timeval wait {0, timeoutUs};
-    return select(descriptor + 1, &readable, nullptr, nullptr, &wait) > 0;
+    // Linux's select leaves in wait the time it did not sleep, so a wait that
+    // a signal cut short resumes for what is left of it, at no extra cost.
+    timeval wait {timeoutUs / 1000000, timeoutUs % 1000000};
+    for (;;) {
+        fd_set readable;
+        FD_ZERO(&readable);
+        FD_SET(descriptor, &readable);
+        const int ready = select(descriptor + 1, &readable, nullptr, nullptr, &wait);
+        if (ready > 0)
+            return HiddevWait::Readable;
+        if (ready == 0)
+            return HiddevWait::TimedOut;
+        if (errno != EINTR || (HiddevStopWaiting != nullptr && HiddevStopWaiting()))
+            return HiddevWait::Ended;
+    }
 }
 
 void HiddevDescribe(std::int32_t descriptor)

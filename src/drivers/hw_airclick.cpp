@@ -131,27 +131,27 @@ std::int32_t AirclickRead()
     if (fd >= FD_SETSIZE)
         return -1;
 
-    for (;;) {
-        if (!HiddevWaitReadable(fd, AIRCLICK_WAIT_US))
-            return 0;
+    // One report per call at most, so that a button that repeats cannot keep
+    // the loop from its other drivers and from the quit flag.
+    if (HiddevWaitReadable(fd, AIRCLICK_WAIT_US) != HiddevWait::Readable)
+        return 0;
 
-        unsigned char report[AIRCLICK_READ_MAX];
-        const ssize_t count = read(fd, report, sizeof report);
-        if (count < 0) {
-            LogError(__FILE_NAME__, 203, "Error reading event.");
-            return -1;
-        }
-        if (count < static_cast<ssize_t>(sizeof(hiddev_event))) {
-            LogError(__FILE_NAME__, 205, "Got short read from device!");
-            return -1;
-        }
-        const std::uint32_t code = AirclickReportCode(report, static_cast<std::size_t>(count), stdout);
-        const RcAction found = AirclickKeyLookup(code, stdout);
-        std::fflush(stdout);
-        const AirclickOutcome outcome = AirclickStep(AirclickRepeat, found, NowMicroseconds());
-        if (outcome.done)
-            return outcome.action;
+    unsigned char report[AIRCLICK_READ_MAX];
+    const ssize_t count = read(fd, report, sizeof report);
+    if (count < 0) {
+        LogError(__FILE_NAME__, 203, "Error reading event.");
+        return -1;
     }
+    if (count < static_cast<ssize_t>(sizeof(hiddev_event))) {
+        LogError(__FILE_NAME__, 205, "Got short read from device!");
+        return -1;
+    }
+    const std::uint32_t code = AirclickReportCode(report, static_cast<std::size_t>(count), stdout);
+    const RcAction found = AirclickKeyLookup(code, stdout);
+    std::fflush(stdout);
+    // A repeat the filter drops gives nothing; the next poll goes on.
+    const AirclickOutcome outcome = AirclickStep(AirclickRepeat, found, NowMicroseconds());
+    return outcome.done ? outcome.action : RC_ACT_NONE;
 }
 
 std::int32_t AirclickClose()

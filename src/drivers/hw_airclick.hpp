@@ -36,7 +36,7 @@ struct AirclickRepeatState {
 extern AirclickRepeatState AirclickRepeat;
 
 // What a report decides: the read returns action, or (done false) drops the
-// report and waits for the next.
+// report and returns 0.
 struct AirclickOutcome {
     bool done;
     RcAction action;
@@ -60,9 +60,9 @@ AirclickOutcome AirclickStep(AirclickRepeatState& state, RcAction found, std::in
 // Opens the device, or keeps the descriptor already open; 0, or -1 (logged).
 std::int32_t AirclickOpen();
 
-// Waits up to 200 ms at a time for reports, dropping repeats, until one
-// gives an action (> 0) or a release (0); 0 after a wait without a report,
-// -1 (logged) on a bad read.
+// Waits up to 200 ms for one report and handles it: its action (> 0), or 0
+// for a release, a dropped repeat or a wait without a report; -1 (logged) on
+// a bad read.
 std::int32_t AirclickRead();
 
 // Closes the device if it is open; 0.

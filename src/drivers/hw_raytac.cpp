@@ -4,8 +4,6 @@
 #include <sys/select.h>
 #include <unistd.h>
 
-#include <cstring>
-
 #include "common/log.hpp"
 #include "common/paths.hpp"
 #include "common/socket.hpp"
@@ -38,8 +36,17 @@ RaytacHoldState RaytacHold = {0, 0, RC_ACT_NONE};
 
 namespace {
 
-// The largest read: hiddev hands over whole events, as many as fit.
-constexpr int RAYTAC_READ_MAX = 512;
+// Reports that came in one read, handed out one per read call in the order
+// they came, before the device is waited on again.
+RaytacReport pending[RAYTAC_READ_REPORTS];
+int pendingCount = 0;  // reports the last read brought
+int pendingNext = 0;   // the next of them to hand out
+
+void DropPending()
+{
+    pendingCount = 0;
+    pendingNext = 0;
+}
 
 // Offers the last key (if any) with result r.
 RaytacHandOver HandOver(const RaytacHoldState& state, RcAction r)
@@ -78,6 +85,12 @@ const RcKeyEntry* RaytacKeyFind(std::uint32_t usage)
 
 RaytacHandOver RaytacStep(RaytacHoldState& state, const RaytacEvent& event)
 {
+    // A dropped read may have held the release of the key that is down: end
+    // the hold rather than let a volume key repeat with nobody touching it.
+    if (event.lost) {
+        state = RaytacHoldState{0, 0, RC_ACT_NONE};
+        return {RC_ACT_NONE, false, 0};
+    }
     if (event.idle)
         return OnIdle(state);
 
@@ -110,6 +123,7 @@ std::int32_t RaytacOpen()
     if (fd < 0)
         return -1;
     raytac.descriptor = fd;
+    DropPending();
     // A key that was down when the receiver went away never sends its
     // release to us: forget it, or a held volume key would step on its own
     // at every idle wait.
@@ -123,30 +137,41 @@ std::int32_t RaytacRead()
     const int fd = raytac.descriptor;
     if (fd < 0)
         return 0;
-    // select cannot watch a descriptor beyond its set; the daemon holds a handful.
-    if (fd >= FD_SETSIZE)
-        return -1;
 
     RaytacEvent event {};
-    // A time-out, and a wait cut short by a signal, are both idle waits.
-    if (!HiddevWaitReadable(fd, RAYTAC_WAIT_US)) {
-        event.idle = true;
+    if (pendingNext < pendingCount) {
+        // Read together with an earlier report: handled as if read alone.
+        event.key = pending[pendingNext++].events[RAYTAC_KEY_EVENT];
     } else {
-        unsigned char report[RAYTAC_READ_MAX];
-        const ssize_t count = read(fd, report, sizeof report);
-        if (count < 0)
+        // select cannot watch a descriptor beyond its set; the daemon holds a handful.
+        if (fd >= FD_SETSIZE)
             return -1;
-        if (count < static_cast<ssize_t>(sizeof(hiddev_event))) {
-            LogError(__FILE_NAME__, 304, "Got short read from device!");
-            return -1;
+        const HiddevWait wait = HiddevWaitReadable(fd, RAYTAC_WAIT_US);
+        // Cut short for the daemon to stop: nothing to act on.
+        if (wait == HiddevWait::Ended)
+            return RC_ACT_NONE;
+        if (wait == HiddevWait::TimedOut) {
+            event.idle = true;
+        } else {
+            const ssize_t count = read(fd, pending, sizeof pending);
+            if (count < 0)
+                return -1;
+            const ssize_t reportSize = sizeof(RaytacReport);
+            if (count == 0 || count % reportSize != 0) {
+                const int bytes = static_cast<int>(count);
+                if (count < static_cast<ssize_t>(sizeof(hiddev_event)))
+                    LogError(__FILE_NAME__, 304, "Got short read from device!");
+                else
+                    LogError(__FILE_NAME__, 311, "The hid response is too short. ret:%d (%d)",
+                             bytes, bytes / static_cast<int>(sizeof(hiddev_event)));
+                event.lost = true;
+                RaytacStep(RaytacHold, event);
+                return -1;
+            }
+            pendingCount = static_cast<int>(count / reportSize);
+            pendingNext = 1;
+            event.key = pending[0].events[RAYTAC_KEY_EVENT];
         }
-        if (count != static_cast<ssize_t>(sizeof(RaytacReport))) {
-            const int bytes = static_cast<int>(count);
-            LogError(__FILE_NAME__, 311, "The hid response is too short. ret:%d (%d)", bytes,
-                     bytes / static_cast<int>(sizeof(hiddev_event)));
-            return -1;
-        }
-        std::memcpy(&event.key, report + RAYTAC_KEY_EVENT * sizeof(hiddev_event), sizeof event.key);
     }
 
     const RaytacHandOver result = RaytacStep(RaytacHold, event);
@@ -161,5 +186,6 @@ std::int32_t RaytacClose()
         close(raytac.descriptor);
         raytac.descriptor = -1;
     }
+    DropPending();
     return 0;
 }

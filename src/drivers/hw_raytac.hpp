@@ -35,7 +35,12 @@ static_assert(offsetof(RaytacReport, events) + RAYTAC_KEY_EVENT * sizeof(hiddev_
 inline constexpr std::int32_t RAYTAC_PRESSED = 1;
 
 // How long one read waits for a report; it paces the volume repeat and the long press.
+// A signal that cuts the wait short does not end it: it resumes for the time left.
 inline constexpr int RAYTAC_WAIT_US = 200000;
+
+// Reports asked for in one read. The kernel hands over every queued event
+// that fits, so asking for whole reports keeps each read in step with them.
+inline constexpr int RAYTAC_READ_REPORTS = 7;
 
 // What the driver remembers between reads, all 0 at start.
 struct RaytacHoldState {
@@ -47,10 +52,12 @@ struct RaytacHoldState {
 // The receiver's hold state, process-wide; cleared when the device is opened.
 extern RaytacHoldState RaytacHold;
 
-// One outcome of a wait on the receiver: an idle wait, or the key of a report.
+// One outcome of a wait on the receiver: an idle wait, the key of a report,
+// or a read that was dropped whole (lost).
 struct RaytacEvent {
     bool idle;
-    hiddev_event key;  // the ninth event of the report when not idle
+    hiddev_event key;   // the ninth event of the report when neither idle nor lost
+    bool lost = false;  // the read may have held a release: no key is down any more
 };
 
 // What a step hands over: when offer is set, code goes to the media-center
@@ -67,11 +74,15 @@ const RcKeyEntry* RaytacKeyFind(std::uint32_t usage);
 // The key-hold decision for one wait: updates the state and says what to hand over.
 RaytacHandOver RaytacStep(RaytacHoldState& state, const RaytacEvent& event);
 
-// Opens the receiver (clearing the hold state); 0 when open (already or now), -1 silently.
+// Opens the receiver (clearing the hold state and any reports left from
+// before); 0 when open (already or now), -1 silently.
 std::int32_t RaytacOpen();
 
-// Waits up to 200 ms for a report; an action (> 0), 0, or -1 on a bad read.
+// Takes the next of the reports that came together in one read, if any;
+// else waits up to 200 ms for a report and reads up to seven at once. An
+// action (> 0), 0, or -1 on a bad read (a read that is not a whole number of
+// reports is dropped, and ends any key hold).
 std::int32_t RaytacRead();
 
-// Closes the receiver if it is open; 0.
+// Closes the receiver if it is open, dropping the reports not yet taken; 0.
 std::int32_t RaytacClose();

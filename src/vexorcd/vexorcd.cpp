@@ -7,6 +7,7 @@
 #include <unistd.h>
 
 #include "common/log.hpp"
+#include "drivers/hiddev.hpp"
 #include "vexorcd/dispatch.hpp"
 #include "vexorcd/registry.hpp"
 #include "vlibc/vlibc.hpp"
@@ -67,6 +68,12 @@ void InstallHandler(int sig, void (*handler)(int))
     sigaction(sig, &sa, nullptr);
 }
 
+// Asked by the receiver when a signal cuts its wait short.
+bool QuitPending()
+{
+    return RcQuitRequested != 0;
+}
+
 }  // namespace
 
 int RcDaemonMain(int argc, char** argv)
@@ -96,6 +103,7 @@ int RcDaemonMain(int argc, char** argv)
 
     WritePidFile();
     RcDriversOpenAll();
+    HiddevStopWaiting = QuitPending;
 
     InstallHandler(SIGPIPE, SIG_IGN);
     InstallHandler(SIGTERM, RcOnQuitSignal);

@@ -101,6 +101,28 @@ HotplugStorm::~HotplugStorm()
     thread_.join();
 }
 
+ThreadSignalStorm::ThreadSignalStorm()
+{
+    struct sigaction sa {};
+    sa.sa_handler = [](int) {};
+    sa.sa_flags = SA_RESTART;
+    sigaction(SIGUSR1, &sa, &saved_);
+    const pthread_t target = pthread_self();
+    thread_ = std::thread([this, target] {
+        while (!stop_) {
+            pthread_kill(target, SIGUSR1);
+            std::this_thread::sleep_for(std::chrono::microseconds(2000));
+        }
+    });
+}
+
+ThreadSignalStorm::~ThreadSignalStorm()
+{
+    stop_ = true;
+    thread_.join();
+    sigaction(SIGUSR1, &saved_, nullptr);
+}
+
 MediaCenterUi::MediaCenterUi(bool reading) : fd_(BindUnix(MEDIA_CENTER, SOCK_DGRAM))
 {
     EXPECT_GE(fd_, 0) << "cannot bind " << MEDIA_CENTER;

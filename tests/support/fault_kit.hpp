@@ -4,6 +4,7 @@
 // the descriptors a process holds.
 #pragma once
 
+#include <signal.h>
 #include <sys/types.h>
 
 #include <array>
@@ -52,6 +53,22 @@ public:
     HotplugStorm& operator=(const HotplugStorm&) = delete;
 
 private:
+    std::atomic<bool> stop_ {false};
+    std::thread thread_;
+};
+
+// A storm of SIGUSR1 at the thread that makes it, about every 2 ms, for its
+// whole life; the signal is caught by a handler that does nothing, installed
+// as the daemon installs its own (SA_RESTART).
+class ThreadSignalStorm {
+public:
+    ThreadSignalStorm();
+    ~ThreadSignalStorm();
+    ThreadSignalStorm(const ThreadSignalStorm&) = delete;
+    ThreadSignalStorm& operator=(const ThreadSignalStorm&) = delete;
+
+private:
+    struct sigaction saved_ {};
     std::atomic<bool> stop_ {false};
     std::thread thread_;
 };

@@ -1,8 +1,10 @@
 // The radio receiver driver: the key-hold decisions driven step by step, and
 // the read around them over a pipe and a FIFO.
 #include <fcntl.h>
+#include <sys/ioctl.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <chrono>
 #include <cstdio>
 #include <cstring>
@@ -12,6 +14,7 @@
 #include <gtest/gtest.h>
 
 #include "drivers/hw_raytac.hpp"
+#include "fault_kit.hpp"
 #include "harness.hpp"
 #include "remote.hpp"
 
@@ -121,39 +124,125 @@ protected:
             bytes[i] = reinterpret_cast<const unsigned char*>(&r)[i % sizeof r];
         ASSERT_EQ(write(pipe_[1], bytes.data(), size), static_cast<ssize_t>(size));
     }
+    // Writes whole reports, one key event each, in one piece.
+    void SendTogether(const std::vector<hiddev_event>& keys) const
+    {
+        std::vector<RaytacReport> reports(keys.size());
+        for (size_t i = 0; i < keys.size(); ++i)
+            reports[i].events[RAYTAC_KEY_EVENT] = keys[i];
+        const size_t size = reports.size() * sizeof(RaytacReport);
+        ASSERT_EQ(write(pipe_[1], reports.data(), size), static_cast<ssize_t>(size));
+    }
+    int Unread() const
+    {
+        int n = -1;
+        ioctl(pipe_[0], FIONREAD, &n);
+        return n;
+    }
     vt::SyslogSink log_;
     int pipe_[2] = {-1, -1};
 };
 
-TEST_F(RaytacReading, BadReportsAreLoggedDroppedAndLeaveTheStateAlone)
+TEST_F(RaytacReading, ReportsReadTogetherAreHandledOneByOneInOrder)
 {
+    constexpr std::uint32_t STOP = 0x0007004F;
+    struct Row {
+        const char* what;
+        bool volumeDown;                  // Volume Plus pressed (and read) first
+        std::vector<hiddev_event> keys;   // written in one piece
+        std::vector<std::int32_t> reads;  // results of the reads that follow, idle waits included
+    };
+    const std::vector<Row> rows = {
+        // A release lost with its read would leave the volume running away.
+        {"release and press", true, {{VOLUME_PLUS, 0}, {STOP, 1}}, {0, RC_ACT_STOP, 0, 0}},
+        {"three reports", false, {{PLAY, 1}, {PLAY, 0}, {NEXT, 1}}, {RC_ACT_PLAY, 0, 0, 0}},
+        // Seven reports fit one read; the eighth comes whole with the next.
+        {"eight reports", false,
+         {{PLAY, 1}, {PLAY, 0}, {PLAY, 1}, {PLAY, 0}, {PLAY, 1}, {PLAY, 0}, {NEXT, 1}, {NEXT, 0}},
+         {RC_ACT_PLAY, 0, RC_ACT_PLAY, 0, RC_ACT_PLAY, 0, 0, RC_ACT_NEXT, 0}},
+    };
+    for (const Row& row : rows) {
+        RaytacHold = RaytacHoldState {};
+        if (row.volumeDown) {
+            Send(VOLUME_PLUS, 1);
+            ASSERT_EQ(RaytacRead(), RC_ACT_VOLUME_UP) << row.what;
+        }
+        SendTogether(row.keys);
+        std::vector<std::int32_t> got;
+        for (size_t i = 0; i < row.reads.size(); ++i) {
+            got.push_back(RaytacRead());
+            if (i == 0) {  // one read took every report that fits
+                EXPECT_EQ(Unread(), row.keys.size() > 7 ? 72 : 0) << row.what;
+            }
+        }
+        EXPECT_EQ(got, row.reads) << row.what;
+    }
+    EXPECT_TRUE(log_.Lines().empty()) << log_.Dump();
+}
+
+TEST_F(RaytacReading, BadReadsAreLoggedDroppedAndEndAnyHold)
+{
+    // Each one carries a Play press where a report's key would be, and comes
+    // while Volume Plus is held: it may have held the release.
+    const std::vector<std::pair<size_t, std::string>> bad = {
+        {80, "hw_raytac.cpp (311) The hid response is too short. ret:80 (10)"},
+        {150, "hw_raytac.cpp (311) The hid response is too short. ret:150 (18)"},
+        {7, "hw_raytac.cpp (304) Got short read from device!"},
+    };
+    for (const auto& [size, message] : bad) {
+        Send(VOLUME_PLUS, 1);
+        ASSERT_EQ(RaytacRead(), RC_ACT_VOLUME_UP);
+        Send(PLAY, 1, size);
+        EXPECT_EQ(RaytacRead(), -1) << size;
+        EXPECT_TRUE(log_.WaitFor(message, 2000)) << log_.Dump();
+        EXPECT_EQ(RaytacHold.heldAction, RC_ACT_NONE) << size;
+        EXPECT_EQ(RaytacHold.lastCode, 0u) << size;
+        EXPECT_EQ(RaytacRead(), 0) << "the volume repeats after a dropped read of " << size;
+    }
+    EXPECT_EQ(log_.Lines().size(), 3u) << log_.Dump();
+
+    // A failing read is silent and changes nothing.
     Send(VOLUME_PLUS, 1);
     ASSERT_EQ(RaytacRead(), RC_ACT_VOLUME_UP);
     const RaytacHoldState before = RaytacHold;
-    const auto expectDropped = [&](const std::string& message) {
-        EXPECT_EQ(RaytacRead(), -1) << message;
-        if (!message.empty()) {
-            EXPECT_TRUE(log_.WaitFor(message, 2000)) << log_.Dump();
-        }
-        EXPECT_EQ(std::memcmp(&RaytacHold, &before, sizeof before), 0) << message;
-    };
-    // Each one carries a Play press where a report's key would be.
-    Send(PLAY, 1, 80);
-    expectDropped("hw_raytac.cpp (311) The hid response is too short. ret:80 (10)");
-    Send(PLAY, 1, 144);  // two reports at once are dropped too
-    expectDropped("hw_raytac.cpp (311) The hid response is too short. ret:144 (18)");
-    Send(PLAY, 1, 7);
-    expectDropped("hw_raytac.cpp (304) Got short read from device!");
-    EXPECT_EQ(log_.Lines().size(), 3u) << log_.Dump();
-
-    // A failing read is silent.
     const int dir = open("/tmp", O_RDONLY | O_DIRECTORY | O_CLOEXEC);
     ASSERT_GE(dir, 0);
     raytac.descriptor = dir;
-    expectDropped("");
+    EXPECT_EQ(RaytacRead(), -1);
+    EXPECT_EQ(std::memcmp(&RaytacHold, &before, sizeof before), 0);
     close(dir);
     usleep(100000);
     EXPECT_EQ(log_.Lines().size(), 3u) << log_.Dump();
+}
+
+TEST_F(RaytacReading, ASignalResumesTheWaitUnlessTheDaemonIsStopping)
+{
+    // Next held for 300 ms under a storm: the waits resume, so it is a short press.
+    Send(NEXT, 1);
+    ASSERT_EQ(RaytacRead(), 0);
+    std::vector<std::int32_t> during;
+    {
+        vt::ThreadSignalStorm storm;
+        const auto start = std::chrono::steady_clock::now();
+        while (std::chrono::steady_clock::now() - start < std::chrono::milliseconds(300))
+            during.push_back(RaytacRead());
+    }
+    EXPECT_LE(during.size(), 2u) << "waits cut short by signals";
+    EXPECT_EQ(std::count(during.begin(), during.end(), RC_ACT_NEXT_HELD), 0);
+    Send(NEXT, 0);
+    EXPECT_EQ(RaytacRead(), RC_ACT_NEXT);
+
+    // Stopping: a signal ends the wait, and a held volume key does not step.
+    Send(VOLUME_PLUS, 1);
+    ASSERT_EQ(RaytacRead(), RC_ACT_VOLUME_UP);
+    HiddevStopWaiting = [] { return true; };
+    {
+        vt::ThreadSignalStorm storm;
+        const auto start = std::chrono::steady_clock::now();
+        EXPECT_EQ(RaytacRead(), 0);
+        EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::milliseconds(150));
+    }
+    HiddevStopWaiting = nullptr;
 }
 
 TEST(RaytacDriver, OpenClearsTheHoldStateOnlyOnARealOpenAndCloseKeepsIt)
@@ -180,6 +269,18 @@ TEST(RaytacDriver, OpenClearsTheHoldStateOnlyOnARealOpenAndCloseKeepsIt)
         EXPECT_EQ(RaytacClose(), 0);
         EXPECT_EQ(raytac.descriptor, -1);
         EXPECT_EQ(RaytacHold.heldAction, RC_ACT_VOLUME_UP);  // close keeps it
+        EXPECT_EQ(RaytacClose(), 0);
+
+        // Reports read together and not yet handed out go with the device.
+        ASSERT_EQ(RaytacOpen(), 0);
+        RaytacReport two[2] = {};
+        two[0].events[RAYTAC_KEY_EVENT] = {PLAY, 1};
+        two[1].events[RAYTAC_KEY_EVENT] = {0x0007004F, 1};  // Stop
+        ASSERT_TRUE(fifo.Write(two, sizeof two));
+        EXPECT_EQ(RaytacRead(), RC_ACT_PLAY);
+        EXPECT_EQ(RaytacClose(), 0);
+        ASSERT_EQ(RaytacOpen(), 0);
+        EXPECT_EQ(RaytacRead(), RC_ACT_NONE);  // an idle wait, not the Stop
         EXPECT_EQ(RaytacClose(), 0);
     }
     // No device: -1, silently, and the closed driver's reads return at once.
