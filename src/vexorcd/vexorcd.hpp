@@ -21,5 +21,6 @@ void RcOnQuitSignal(int sig);
 std::int32_t RcLoopTurn(RcDriver* const* table, std::int32_t (*dispatch)(RcAction));
 
 // The whole program: usage, single-instance guard, detach, pid file, drivers,
-// signals, loop, shutdown. Returns the exit status (always 0).
+// signals, loop, shutdown. Returns the exit status: 1 when it cannot detach,
+// else 0 (a refused start included).
 int RcDaemonMain(int argc, char** argv);

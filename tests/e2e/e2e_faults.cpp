@@ -406,17 +406,37 @@ TEST_F(Faults, UnwritablePidFileIsLoggedAndTheDaemonServesOn)
         EXPECT_EQ(daemon_.Stop(SIGTERM, kStopMs), 0);
     }
     {
-        // Full: the file can be created, but its pid cannot be written.
+        // Full: the file can be created, but its pid cannot be written. It
+        // stays empty and locked: a second start is still refused.
         OwnRun full("size=4k,mode=0755");
         vt::WriteFile("/run/filler", std::string(4096, 'x'));
         ASSERT_GT(daemon_.Start(true, false), 0);
         Served(RC_ACT_STOP, AUDIO_CMD_STOP);
-        // An empty pid file would let a second instance start beside this one.
-        const std::string pid = vt::ReadFile(kPidFile);
-        EXPECT_TRUE(!vt::PathExists(kPidFile) || pid == std::to_string(daemon_.Pid()))
-            << "pid file holds \"" << pid << "\"";
+        EXPECT_EQ(vt::ReadFile(kPidFile), "");
         EXPECT_TRUE(log_.WaitFor("(No space left on device)", 1000)) << log_.Dump();
+        std::string out;
+        EXPECT_EQ(vt::RunToEnd({vt::BinPath("vexorcd")}, &out), 0);
+        EXPECT_EQ(out, "vexorcd already exists. pid[0]\n");
+        EXPECT_EQ(vt::FindAdoptedChild(daemon_.Pid()), 0) << "a second daemon";
         EXPECT_EQ(daemon_.Stop(SIGTERM, kStopMs), 0);
+        EXPECT_FALSE(vt::PathExists(kPidFile));
+    }
+    // A symlink at the path is not followed, whether its target exists or
+    // not; the daemon runs on without a pid file and leaves the link alone.
+    for (const char* target : {"/tmp/precious", "/tmp/absent"}) {
+        if (std::string(target) == "/tmp/precious")
+            vt::WriteFile(target, "keep");
+        ASSERT_EQ(symlink(target, kPidFile), 0);
+        ASSERT_GT(daemon_.Start(true, false), 0);
+        ASSERT_TRUE(log_.WaitFor("(Too many levels of symbolic links)")) << log_.Dump();
+        Served(RC_ACT_PLAY, AUDIO_CMD_PLAY);
+        EXPECT_EQ(daemon_.Stop(SIGTERM, kStopMs), 0);
+        struct stat st {};
+        EXPECT_EQ(lstat(kPidFile, &st), 0);
+        EXPECT_TRUE(S_ISLNK(st.st_mode)) << target;
+        EXPECT_EQ(vt::ReadFile(target), std::string(target) == "/tmp/precious" ? "keep" : "");
+        EXPECT_EQ(vt::PathExists("/tmp/absent"), false);
+        unlink(kPidFile);
     }
 }
 

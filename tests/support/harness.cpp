@@ -406,10 +406,6 @@ Daemon::~Daemon()
     }
 }
 
-namespace {
-
-// The first process whose parent is this one and that we did not start as a
-// Process (those are still tracked by their owners): the adopted daemon.
 pid_t FindAdoptedChild(pid_t exclude)
 {
     DIR* dir = opendir("/proc");
@@ -435,8 +431,6 @@ pid_t FindAdoptedChild(pid_t exclude)
     closedir(dir);
     return found;
 }
-
-}  // namespace
 
 bool ProbeControlSocket(int timeoutMs)
 {

@@ -107,6 +107,10 @@ int Vexorctl(std::vector<std::string> args, std::string* out = nullptr);
 // daemon has read it and closed the connection: proof that its loop runs.
 bool ProbeControlSocket(int timeoutMs = 10000);
 
+// The first live process other than exclude whose parent is this one: once
+// the programs it started have ended, a daemon it adopted (0 when none).
+pid_t FindAdoptedChild(pid_t exclude = 0);
+
 // The real vexorcd binary with its built-in paths.
 class Daemon {
 public:
