@@ -95,19 +95,34 @@ int WaitUntilDeadline(int fd, short events, std::int64_t deadlineUs)
     }
 }
 
-// Connects fd to the audio daemon. A send time-out bounds the connect: when
-// the daemon's listen queue is full, the connect fails with EAGAIN after the
-// budget instead of blocking for ever (and a signal interrupts it).
+// Connects fd to the audio daemon within the budget. A send time-out bounds
+// the connect: when the daemon's listen queue is full, the connect fails with
+// EAGAIN after the budget instead of blocking for ever. With a time-out set,
+// the kernel does not restart a connect that a signal interrupts, so it is
+// tried again for what is left of the budget.
 int ConnectBounded(int fd)
 {
-    timeval limit {};
-    limit.tv_sec = static_cast<time_t>(AUDIO_BUDGET_US / 1000000);
-    limit.tv_usec = static_cast<suseconds_t>(AUDIO_BUDGET_US % 1000000);
-    if (setsockopt(fd, SOL_SOCKET, SO_SNDTIMEO, &limit, sizeof limit) != 0)
-        return -1;
     sockaddr_un addr;
     SocketFillAddress(addr, AUDIO_SOCKET_PATH);
-    return connect(fd, reinterpret_cast<const sockaddr*>(&addr), SOCKET_ADDRESS_LENGTH);
+    const std::int64_t deadline = NowUs() + AUDIO_BUDGET_US;
+    std::int64_t left = AUDIO_BUDGET_US;
+    for (;;) {
+        timeval limit {};
+        limit.tv_sec = static_cast<time_t>(left / 1000000);
+        limit.tv_usec = static_cast<suseconds_t>(left % 1000000);
+        if (setsockopt(fd, SOL_SOCKET, SO_SNDTIMEO, &limit, sizeof limit) != 0)
+            return -1;
+        if (connect(fd, reinterpret_cast<const sockaddr*>(&addr), SOCKET_ADDRESS_LENGTH) == 0)
+            return 0;
+        if (errno != EINTR)
+            return -1;
+        // Never retried with 0 left: a time-out of 0 would mean no limit at all.
+        left = deadline - NowUs();
+        if (left <= 0) {
+            errno = EAGAIN;  // the budget is spent, as by a connect that timed out
+            return -1;
+        }
+    }
 }
 
 // Everything after the connect: both waits share one budget.

@@ -3,8 +3,9 @@
 //
 // Every command travels as one fixed 8196-byte record on its own connection to
 // the audio daemon's socket (AUDIO_SOCKET_PATH); it answers with at least one byte.
-// The two waits of an exchange (for writability, then for the reply) share
-// one budget of 500 ms; the connect is bounded by the same 500 ms.
+// The connect is bounded by 500 ms, and the two waits of an exchange (for
+// writability, then for the reply) share a second budget of 500 ms: one
+// exchange takes at most about a second, signals or not.
 #pragma once
 
 #include <cstddef>
@@ -17,7 +18,7 @@
 inline constexpr std::int32_t AUDIO_ARG_SIZE = 8192;
 inline constexpr std::int32_t AUDIO_REPLY_SIZE = 8192;
 
-// The time budget of one exchange, in microseconds.
+// The time budget of the connect, and that of the two waits, in microseconds.
 inline constexpr std::int64_t AUDIO_BUDGET_US = 500000;
 
 // The request: the command code in the machine's byte order, then the

@@ -37,8 +37,9 @@ using Mode = vt::AudioPeer::Mode;
 constexpr char kDevice[] = "/dev/usb/hiddev5";
 constexpr char kPidFile[] = "/var/run/vexorcd.pid";
 // A second, plus the receiver's wait and one exchange with the audio daemon
-// that may be under way when SIGTERM arrives...
-constexpr int kStopBudgetMs = 1000 + 200 + 500;
+// (500 ms to connect, 500 ms for its waits) that may be under way when
+// SIGTERM arrives...
+constexpr int kStopBudgetMs = 1000 + 200 + 500 + 500;
 // ...and room for the emulator and the sanitizers to start and end a process.
 constexpr int kStopMs = kStopBudgetMs + 1500;
 

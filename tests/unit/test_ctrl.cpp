@@ -6,11 +6,13 @@
 #include <chrono>
 #include <cstring>
 #include <string>
+#include <thread>
 
 #include <gtest/gtest.h>
 
 #include "audio_peer.hpp"
 #include "audioctl/ctrl.hpp"
+#include "fault_kit.hpp"
 #include "harness.hpp"
 
 namespace {
@@ -105,6 +107,22 @@ TEST(CtrlExchange, APeerThatStopsAcceptingCannotHangTheClient)
     }
     EXPECT_TRUE(log.WaitFor("ctrl.cpp:27 Failed to connect to /tmp/vexoaudiod.sock. "
                             "[Resource temporarily unavailable]")) << log.Dump();
+
+    // Signals while the connect waits for room do not lose the command: the
+    // connect goes on for what is left of its budget.
+    std::int32_t result = -1;
+    {
+        vt::ThreadSignalStorm storm;
+        std::thread accepting([&] {
+            usleep(200000);
+            peer.SetMode(Mode::Answer);
+        });
+        TimedTransact(&result);
+        accepting.join();
+    }
+    EXPECT_EQ(result, 0);
+    usleep(100000);
+    EXPECT_EQ(log.Count("[Interrupted system call]"), 0) << log.Dump();
 }
 
 // ---- Equalizer profile ----------------------------------------------------
