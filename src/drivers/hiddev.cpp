@@ -4,8 +4,20 @@
 #include <sys/select.h>
 
 #include <cerrno>
+#include <ctime>
 
 bool (*HiddevStopWaiting)() = nullptr;
+
+namespace {
+
+std::int64_t MonotonicUs()
+{
+    timespec now {};
+    clock_gettime(CLOCK_MONOTONIC, &now);
+    return static_cast<std::int64_t>(now.tv_sec) * 1000000 + now.tv_nsec / 1000;
+}
+
+}  // namespace
 
 // The request numbers differ between architectures in their direction bits
 // (0x40 on PowerPC, 0x80 on x86); the record sizes are the same on both.
@@ -42,13 +54,15 @@ void HiddevPrint(std::FILE* out, const std::int32_t* version, const hiddev_devin
 
 HiddevWait HiddevWaitReadable(std::int32_t descriptor, long timeoutUs)
 {
-    // Linux's select leaves in wait the time it did not sleep, so a wait that
-    // a signal cut short resumes for what is left of it, at no extra cost.
-    timeval wait {timeoutUs / 1000000, timeoutUs % 1000000};
+    // A wait that a signal cut short resumes for what is left of it, taken
+    // from the monotonic clock (select does not say, under an emulator).
+    const std::int64_t deadline = MonotonicUs() + timeoutUs;
+    std::int64_t left = timeoutUs;
     for (;;) {
         fd_set readable;
         FD_ZERO(&readable);
         FD_SET(descriptor, &readable);
+        timeval wait {static_cast<time_t>(left / 1000000), static_cast<suseconds_t>(left % 1000000)};
         const int ready = select(descriptor + 1, &readable, nullptr, nullptr, &wait);
         if (ready > 0)
             return HiddevWait::Readable;
@@ -56,6 +70,9 @@ HiddevWait HiddevWaitReadable(std::int32_t descriptor, long timeoutUs)
             return HiddevWait::TimedOut;
         if (errno != EINTR || (HiddevStopWaiting != nullptr && HiddevStopWaiting()))
             return HiddevWait::Ended;
+        left = deadline - MonotonicUs();
+        if (left < 0)
+            left = 0;
     }
 }
 
