@@ -7,7 +7,7 @@ add_subdirectory(/usr/src/googletest ${CMAKE_BINARY_DIR}/googletest EXCLUDE_FROM
 target_compile_options(gtest PRIVATE -Wno-restrict)
 target_compile_options(gtest_main PRIVATE -Wno-restrict)
 
-# Every test runs in its own private mount namespace (fresh /tmp, /run, /dev),
+# Every test runs in its own private namespaces (fresh /tmp, /run, /var, /dev),
 # so the built-in paths of the daemon can be used without touching the host.
 set(VEXO_SANDBOX ${CMAKE_SOURCE_DIR}/tests/sandbox.sh)
 if(CMAKE_CROSSCOMPILING_EMULATOR)
@@ -16,53 +16,35 @@ else()
   set(VEXO_EMULATOR_TEXT "")
 endif()
 
-file(GLOB SUPPORT_SOURCES CONFIGURE_DEPENDS tests/support/*.cpp)
-add_library(vexotestsupport STATIC ${SUPPORT_SOURCES})
-target_include_directories(vexotestsupport PUBLIC tests/support src)
-target_link_libraries(vexotestsupport PUBLIC vexocore GTest::gtest vexo_warnings)
-target_compile_definitions(vexotestsupport PUBLIC
+# The test support (tests/support/harness.hpp) runs the build's programs.
+add_library(vexotestsupport INTERFACE)
+target_include_directories(vexotestsupport INTERFACE tests/support)
+target_link_libraries(vexotestsupport INTERFACE vexotools GTest::gtest_main vexo_warnings)
+target_compile_definitions(vexotestsupport INTERFACE
   VEXO_BIN_DIR="${CMAKE_BINARY_DIR}/bin"
-  VEXO_EMULATOR="${VEXO_EMULATOR_TEXT}"
-  VEXO_SOURCE_DIR="${CMAKE_SOURCE_DIR}")
+  VEXO_EMULATOR="${VEXO_EMULATOR_TEXT}")
 
-function(vexo_add_test kind src)
+# Unit tests start the system logger's stand-in, end-to-end tests the daemon
+# and every tool: all of them are built first.
+file(GLOB TESTS CONFIGURE_DEPENDS tests/unit/test_*.cpp tests/e2e/e2e_*.cpp)
+foreach(src ${TESTS})
   get_filename_component(name ${src} NAME_WE)
+  get_filename_component(dir ${src} DIRECTORY)
+  get_filename_component(kind ${dir} NAME)
   add_executable(${name} ${src})
-  target_link_libraries(${name} PRIVATE vexotestsupport GTest::gtest_main)
+  target_link_libraries(${name} PRIVATE vexotestsupport)
+  add_dependencies(${name} vexorcd ${VEXO_TOOLS})
   add_test(NAME ${kind}.${name}
            COMMAND ${VEXO_SANDBOX} ${CMAKE_CROSSCOMPILING_EMULATOR} $<TARGET_FILE:${name}>)
-  set_tests_properties(${kind}.${name} PROPERTIES TIMEOUT 600 LABELS ${kind})
-endfunction()
-
-file(GLOB UNIT_TESTS CONFIGURE_DEPENDS tests/unit/test_*.cpp)
-foreach(src ${UNIT_TESTS})
-  vexo_add_test(unit ${src})
-endforeach()
-
-file(GLOB E2E_TESTS CONFIGURE_DEPENDS tests/e2e/e2e_*.cpp)
-foreach(src ${E2E_TESTS})
-  vexo_add_test(e2e ${src})
-  get_filename_component(name ${src} NAME_WE)
-  # End-to-end tests start the daemon and the tools: build them first.
-  add_dependencies(${name} vexorcd ${VEXO_TOOLS})
+  set_tests_properties(${kind}.${name} PROPERTIES TIMEOUT 300 LABELS ${kind})
 endforeach()
 
 file(GLOB SCRIPT_TESTS CONFIGURE_DEPENDS tests/scripts/test_*.sh)
 foreach(src ${SCRIPT_TESTS})
   get_filename_component(name ${src} NAME_WE)
   add_test(NAME script.${name} COMMAND ${VEXO_SANDBOX} bash ${src})
-  set_tests_properties(script.${name} PROPERTIES TIMEOUT 600 LABELS script
+  set_tests_properties(script.${name} PROPERTIES TIMEOUT 300 LABELS script
     ENVIRONMENT "VEXO_BIN_DIR=${CMAKE_BINARY_DIR}/bin;VEXO_SOURCE_DIR=${CMAKE_SOURCE_DIR};VEXO_EMULATOR=${VEXO_EMULATOR_TEXT}")
-endforeach()
-
-# Soak runs (tests/soak/soak_*.cpp) start the real daemon like the end-to-end
-# tests. ctest runs a short one; tests/soak/run.sh runs them for longer.
-file(GLOB SOAK_TESTS CONFIGURE_DEPENDS tests/soak/soak_*.cpp)
-foreach(src ${SOAK_TESTS})
-  vexo_add_test(soak ${src})
-  get_filename_component(name ${src} NAME_WE)
-  add_dependencies(${name} vexorcd)
-  set_tests_properties(soak.${name} PROPERTIES ENVIRONMENT "VEXO_SOAK_SECONDS=40")
 endforeach()
 
 # The first process of the PowerPC machine that tests/kernel/run.sh boots.

@@ -1,140 +1,200 @@
-// End-to-end harness: runs the real daemon and the tools inside the private
-// mount namespace that tests/sandbox.sh makes for every test, captures
-// syslog from /dev/log, and stops only the processes it started, by pid.
-// Under the PowerPC build every program is launched through the emulator.
+// Test support. Tests run inside tests/sandbox.sh, so the code under test and
+// the build's programs (the daemon, the stand-in peers, vexorctl) use their
+// built-in paths; the programs run as they are (on the PowerPC build through
+// the emulator) and are read line by line. Only our own children are signalled.
 #pragma once
 
-#include <sys/types.h>
+#include <fcntl.h>
+#include <poll.h>
+#include <sys/prctl.h>
+#include <sys/wait.h>
+#include <syslog.h>
+#include <unistd.h>
 
 #include <chrono>
-#include <functional>
-#include <memory>
-#include <mutex>
-#include <string>
-#include <thread>
-#include <vector>
+#include <csignal>
+#include <fstream>
+#include <iterator>
+#include <set>
+#include <sstream>
+
+#include <gtest/gtest.h>
+
+#include "common/socket.hpp"
 
 namespace vt {
 
-// Fails the test at once unless it runs inside tests/sandbox.sh.
-void RequireSandbox();
+// Outside the sandbox the built-in paths are the machine's own: refuse to run.
+inline const bool inSandbox = [] {
+    if (std::getenv("VEXO_IN_SANDBOX") == nullptr)
+        std::abort();
+    return prctl(PR_SET_CHILD_SUBREAPER, 1, 0, 0, 0) == 0;  // the detached daemon stays our child
+}();
 
-// Full path of one of the project's programs in the build tree.
-std::string BinPath(const std::string& program);
+// Polls cond every 5 ms until it holds, for at most ms.
+template <typename Cond>
+bool WaitUntil(Cond cond, int ms = 5000)
+{
+    const auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(ms);
+    for (; !cond(); usleep(5000))
+        if (std::chrono::steady_clock::now() > end)
+            return false;
+    return true;
+}
 
-// Polls cond every few milliseconds until it holds or timeoutMs pass.
-bool WaitUntil(const std::function<bool()>& cond, int timeoutMs);
+inline std::string ReadFile(const std::string& path)
+{
+    std::ostringstream text;
+    text << std::ifstream(path).rdbuf();
+    return text.str();
+}
+inline void WriteFile(const std::string& path, const std::string& text) { std::ofstream(path) << text; }
 
-bool PathExists(const std::string& path);
-std::string ReadFile(const std::string& path);
-void WriteFile(const std::string& path, const std::string& content);
-// Makes every directory that leads to path ("/a/b" for "/a/b/file").
-void MakeParentDirs(const std::string& path);
+// A Unix socket connected to path, or bound there in place of what stood there; -1 on failure.
+inline int UnixSocket(const char* path, int type, bool bound = false)
+{
+    sockaddr_un addr;
+    const int fd = socket(AF_UNIX, type | SOCK_CLOEXEC, 0);
+    const auto* a = reinterpret_cast<const sockaddr*>(&addr);
+    if (bound)
+        unlink(path);
+    if (SocketFillAddress(addr, path) && (bound ? bind(fd, a, sizeof addr) : connect(fd, a, sizeof addr)) == 0)
+        return fd;
+    close(fd);
+    return -1;
+}
 
-// A syslog daemon of our own: binds a datagram socket at /dev/log and keeps
-// the text of every message (the part after "ident: ").
-class SyslogSink {
-public:
-    SyslogSink();
-    ~SyslogSink();
-    SyslogSink(const SyslogSink&) = delete;
-    SyslogSink& operator=(const SyslogSink&) = delete;
+inline std::string Bin(const std::string& name) { return VEXO_BIN_DIR "/" + name; }
+inline std::set<pid_t> started;  // programs not yet reaped: never taken for the daemon
 
-    std::vector<std::string> Lines() const;
-    // Waits until some message contains needle.
-    bool WaitFor(const std::string& needle, int timeoutMs = 5000) const;
-    // Number of messages that contain needle.
-    int Count(const std::string& needle) const;
-    void Clear();
-    // All messages, one per line, for failure output.
-    std::string Dump() const;
-
-private:
-    void Run();
-    int fd_ = -1;
-    int stopPipe_[2] = {-1, -1};
-    mutable std::mutex mu_;
-    std::vector<std::string> lines_;
-    std::thread reader_;
-};
-
-// A program started by the harness; its stdout (and stderr, if asked) comes
-// through a pipe.
-class Process {
-public:
-    Process() = default;
-    ~Process();
-    Process(Process&& other) noexcept;
-    Process& operator=(Process&& other) noexcept;
-    Process(const Process&) = delete;
-    Process& operator=(const Process&) = delete;
-
-    // Starts argv[0] (a path) with the emulator in front when the build has
-    // one; stdout is captured, stderr too when mergeStderr.
-    static Process Start(const std::vector<std::string>& argv, bool mergeStderr = false);
-
-    pid_t Pid() const { return pid_; }
-    // Reads one line of output (without the newline) within timeoutMs.
-    bool ReadLine(std::string& line, int timeoutMs = 5000);
-    // Reads output lines until one contains needle; the lines read are kept.
-    bool WaitForOutput(const std::string& needle, int timeoutMs = 5000);
-    // Everything read so far, and whatever is left once the process has ended.
-    std::string Output();
-    void Signal(int sig) const;
-    // Waits for the exit and returns the status as waitpid gives it, or -1
-    // on time-out (the process is then killed).
-    int Wait(int timeoutMs = 10000);
-    bool Running();
-
-private:
-    bool Fill(int timeoutMs);
-    pid_t pid_ = -1;  // negated once reaped
-    int exitStatus_ = -1;
-    int out_ = -1;
+// A program of the build (argv[0] is its name), its output and errors on a
+// pipe; killed at the end if it still runs.
+class Program {
+    int out_ = -1, status_ = -1;
     std::string buffer_;
-    std::string seen_;
-};
 
-// Runs a program to its end and returns its exit code (or -1); output in *out.
-int RunToEnd(const std::vector<std::string>& argv, std::string* out = nullptr,
-             int timeoutMs = 20000);
-
-// Runs vexorctl with args to its end and returns its exit code (or -1); its
-// standard output and error together in *out.
-int Vexorctl(std::vector<std::string> args, std::string* out = nullptr);
-
-// Sends action 0 (nothing to do) on "/tmp/vexoctrl" and waits until the
-// daemon has read it and closed the connection: proof that its loop runs.
-bool ProbeControlSocket(int timeoutMs = 10000);
-
-// The first live process other than exclude whose parent is this one: once
-// the programs it started have ended, a daemon it adopted (0 when none).
-pid_t FindAdoptedChild(pid_t exclude = 0);
-
-// The real vexorcd binary with its built-in paths.
-class Daemon {
 public:
-    Daemon();
-    ~Daemon();  // stops the daemon if it still runs
+    explicit Program(std::vector<std::string> argv)
+    {
+        std::istringstream emulator(VEXO_EMULATOR);
+        std::vector<std::string> all {std::istream_iterator<std::string>(emulator), {}};
+        argv[0] = Bin(argv[0]);
+        all.insert(all.end(), argv.begin(), argv.end());
+        std::vector<char*> args;
+        for (std::string& a : all)
+            args.push_back(a.data());
+        args.push_back(nullptr);
+        int pipefd[2];
+        EXPECT_EQ(pipe2(pipefd, O_CLOEXEC), 0);
+        if ((pid = fork()) == 0) {
+            dup2(pipefd[1], 1);
+            dup2(pipefd[1], 2);
+            _exit(execvp(args[0], args.data()));
+        }
+        close(pipefd[1]);
+        out_ = pipefd[0];
+        started.insert(pid);
+    }
+    ~Program()
+    {
+        Wait(0);
+        close(out_);
+    }
+    Program(const Program&) = delete;
+    Program& operator=(const Program&) = delete;
 
-    // Starts the daemon, waits for it to detach, to write its pid file and,
-    // if waitForControlSocket, to listen on "/tmp/vexoctrl". Returns its pid
-    // (0 on failure, with a test failure recorded). Without a pid file
-    // (expectPidFile false) the daemon is found as the orphan it leaves
-    // behind, which the harness, a child subreaper, adopts.
-    pid_t Start(bool waitForControlSocket = true, bool expectPidFile = true);
-    pid_t Pid() const { return pid_; }
-    bool Alive() const;
-    void Signal(int sig) const;
-    // Sends sig and waits for the exit; returns the exit code (-1 on a crash
-    // or time-out). Fails the test if a sanitizer reported anything.
-    int Stop(int sig = 15, int timeoutMs = 10000);
-
-private:
-    pid_t pid_ = 0;
+    // The next line of output, if one comes within about ms.
+    bool Line(std::string& line, int ms = 5000)
+    {
+        for (char chunk[4096]; buffer_.find('\n') == std::string::npos;) {
+            pollfd ready {out_, POLLIN, 0};
+            const ssize_t n = poll(&ready, 1, ms) > 0 ? read(out_, chunk, sizeof chunk) : 0;
+            if (n <= 0)
+                return false;
+            buffer_.append(chunk, static_cast<std::size_t>(n));
+        }
+        line = buffer_.substr(0, buffer_.find('\n'));
+        buffer_.erase(0, line.size() + 1);
+        return true;
+    }
+    // Reads lines until one is text.
+    bool Expect(const std::string& text)
+    {
+        std::string line;
+        while (Line(line) && line != text) {
+        }
+        return line == text;
+    }
+    // The exit code once it has ended, or -1 after a signal or ms (it is then killed).
+    int Wait(int ms = 20000)
+    {
+        if (started.erase(pid) != 0 && !WaitUntil([&] { return waitpid(pid, &status_, WNOHANG) == pid; }, ms)) {
+            kill(pid, SIGKILL);
+            waitpid(pid, &status_, 0);
+        }
+        return WIFEXITED(status_) ? WEXITSTATUS(status_) : -1;
+    }
+    pid_t pid = -1;
 };
 
-// Fails the test if a sanitizer of any program wrote a report.
-void ExpectNoSanitizerReports();
+// Runs a program to its end: its exit code, its output in *out.
+inline int Run(const std::vector<std::string>& argv, std::string* out = nullptr)
+{
+    Program program(argv);
+    const int code = program.Wait();
+    for (std::string line; out != nullptr && program.Line(line, 0);)
+        *out += line + "\n";
+    return code;
+}
+
+// The messages logged since the last call: tools/syslog-sink on /dev/log
+// prints them, and a marker the test logs itself shows where they end.
+inline std::vector<std::string> Logged()
+{
+    static Program sink({"syslog-sink"});
+    static const bool ready = sink.Expect("syslog-sink: listening on /dev/log");
+    static int marks = 0;
+    const std::string mark = "vexo-test-mark " + std::to_string(++marks);
+    syslog(LOG_ERR, "%s", mark.c_str());
+    std::vector<std::string> lines;
+    std::string line;
+    while (ready && sink.Line(line) && line != mark)
+        lines.push_back(line);
+    EXPECT_EQ(line, mark) << "no system logger";
+    return lines;
+}
+
+// The real vexorcd, started with its built-in paths; ready once its loop
+// serves a client (its signal handlers are then in place). Else pid stays 0
+// and the test fails. Killed at the end if it still runs.
+struct Daemon {
+    Daemon()
+    {
+        EXPECT_EQ(Run({"vexorcd"}), 0);
+        // daemon() has forked and the parent has gone: the orphan is ours.
+        const std::string self = std::to_string(getpid());
+        std::istringstream children(ReadFile("/proc/" + self + "/task/" + self + "/children"));
+        for (pid_t child = 0; children >> child;)
+            pid = started.count(child) == 0 ? child : pid;
+        if (pid <= 0 || !WaitUntil([] { return Run({"vexorctl", "0"}) == 0; }, 10000)) {
+            ADD_FAILURE() << "vexorcd did not start";
+            Stop(SIGKILL);
+        }
+    }
+    ~Daemon() { Stop(SIGKILL); }
+    // Sends sig and waits for the exit: the exit code, or -1 after a signal or ms.
+    int Stop(int sig = SIGTERM, int ms = 5000)
+    {
+        int status = -1;
+        if (pid > 0 && kill(pid, sig) == 0 && !WaitUntil([&] { return waitpid(pid, &status, WNOHANG) == pid; }, ms)) {
+            ADD_FAILURE() << "vexorcd did not stop within " << ms << " ms";
+            kill(pid, SIGKILL);
+            waitpid(pid, &status, 0);
+        }
+        pid = 0;
+        return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+    }
+    pid_t pid = 0;
+};
 
 }  // namespace vt

@@ -1,205 +1,47 @@
-// The AirClick driver: its decisions on their own, then whole reads of
-// reports written into a FIFO at the device path.
-#include <fcntl.h>
-#include <linux/hiddev.h>
-#include <sys/ioctl.h>
-#include <sys/stat.h>
-#include <sys/time.h>
-#include <unistd.h>
-
-#include <cstdint>
-#include <cstdio>
+// The AirClick remote's decisions: the button of a report, its action, and
+// the press filter with the volume throttle, driven without a clock.
 #include <cstring>
 #include <string>
-#include <thread>
 #include <vector>
 
 #include <gtest/gtest.h>
 
+#include "drivers/hiddev.hpp"
 #include "drivers/hw_airclick.hpp"
-#include "harness.hpp"
-#include "vexorcd/registry.hpp"
 
-namespace {
-
-constexpr char kDevice[] = "/dev/usb/hiddev1";
-constexpr std::uint32_t kPlay = 0xFA, kNext = 0xF3, kVolumePlus = 0xF9, kRelease = 0xFB;
-constexpr std::int64_t kT0 = 1'700'000'000'000'000;
-
-using Bytes = std::vector<unsigned char>;
-
-// A report of `events` events whose usages carry a value: i in event i, the
-// button code in the fifth.
-Bytes Report(std::uint32_t button, std::size_t events = 5)
+// The button of a report of n events whose usages carry a value (i in event
+// i, button in the fifth), but the fifth's when noValue.
+static std::uint32_t Button(std::uint32_t button, std::size_t n, bool noValue = false)
 {
-    Bytes out(events * sizeof(hiddev_event));
-    for (std::size_t i = 0; i < events; ++i) {
-        const hiddev_event ev {0x000C0001u + static_cast<unsigned>(i),
-                               static_cast<std::int32_t>(i == 4 ? button : i)};
-        std::memcpy(out.data() + i * sizeof ev, &ev, sizeof ev);
+    std::string report(n * sizeof(hiddev_event), '\0');
+    for (std::size_t i = 0; i < n; ++i) {
+        const hiddev_event ev {i == 4 && noValue ? 0x000C0100u : 0x000C0001u, static_cast<std::int32_t>(i == 4 ? button : i)};
+        std::memcpy(report.data() + i * sizeof ev, &ev, sizeof ev);
     }
-    return out;
+    return AirclickReportCode(reinterpret_cast<const unsigned char*>(report.data()), report.size(), nullptr);
 }
 
-TEST(AirclickDecisions, TheButtonIsTheValueOfAFifthEventThatCarriesOne)
+TEST(Airclick, TheButtonOfAReportItsActionAndTheRepeatsThatCount)
 {
-    char line[512] = {};
-    std::FILE* f = fmemopen(line, sizeof line, "w");
-    EXPECT_EQ(AirclickReportCode(Report(kPlay).data(), 40, f), kPlay);
-    EXPECT_EQ(AirclickKeyLookup(kPlay, f), RC_ACT_PLAY);
-    EXPECT_EQ(AirclickKeyLookup(kRelease, f), RC_ACT_NONE);  // matches, and the search runs on
-    std::fclose(f);
-    EXPECT_STREQ(line, "Got value: 0 \t1 \t2 \t3 \t250 \t\nPlay\nButton Released\n");
-
-    EXPECT_EQ(AirclickReportCode(Report(kNext, 7).data(), 56, nullptr), kNext);
-    // Fewer than five events, or a fifth whose usage has a zero lowest byte:
-    // no button, though the report before had one there.
-    EXPECT_EQ(AirclickReportCode(Report(kPlay, 4).data(), 32, nullptr), 0u);
-    Bytes blank = Report(kPlay);
-    const std::uint32_t noValue = 0x000C0100;
-    std::memcpy(blank.data() + 32, &noValue, 4);
-    EXPECT_EQ(AirclickReportCode(blank.data(), blank.size(), nullptr), 0u);
-
-    for (auto [code, action] : {std::pair{0xF3u, RC_ACT_NEXT}, {0xEBu, RC_ACT_PREV},
-                                {0xF9u, RC_ACT_VOLUME_UP}, {0xF7u, RC_ACT_VOLUME_DOWN}, {0u, 0}})
+    EXPECT_EQ((std::vector<std::uint32_t> {Button(0xFA, 5), Button(0xF3, 7), Button(0xFA, 4), Button(0xFA, 5, true)}),
+              (std::vector<std::uint32_t> {0xFA, 0xF3, 0, 0}));
+    // A release matches its entry but gives no action, like an unknown button.
+    for (const auto& [code, action] : {std::pair {0xFAu, 6}, {0xF3u, 7}, {0xEBu, 8}, {0xF9u, 9}, {0xF7u, 10}, {0xFBu, 0}, {0u, 0}})
         EXPECT_EQ(AirclickKeyLookup(code, nullptr), action) << code;
-}
-
-TEST(AirclickDecisions, PressesCountOnceAndHeldVolumeRepeatsOncePer200ms)
-{
-    AirclickRepeatState s {0, 0};
-    auto step = [&](RcAction found, std::int64_t now = kT0) {
-        const AirclickOutcome o = AirclickStep(s, found, now);
-        return o.done ? o.action : -1;  // -1: dropped, the read waits again
+    // A press counts once, the release (0) ends a read too; Volume Plus every 50 ms
+    // repeats at once, then one time in four; a clock set back repeats at once.
+    AirclickRepeatState state {0, 0};
+    std::vector<RcAction> given;  // -1: dropped, the read waits on
+    const auto step = [&](RcAction found, std::int64_t now) {
+        const AirclickOutcome o = AirclickStep(state, found, now);
+        given.push_back(o.done ? o.action : -1);
     };
-    EXPECT_EQ(step(RC_ACT_PLAY), RC_ACT_PLAY);
-    EXPECT_EQ(step(RC_ACT_PLAY), -1);
-    EXPECT_EQ(step(RC_ACT_NEXT), RC_ACT_NEXT);  // another button at once
-    EXPECT_EQ(step(0), 0);                      // the release ends the read
-    EXPECT_EQ(step(0), -1);
-    EXPECT_EQ(s.lastRepeatTime, 0);
-
-    // Volume Plus every 50 ms, long after any repeat: the press, a repeat at
-    // once, then one in four, counted from the last repeat given.
-    std::vector<RcAction> given;
+    for (const RcAction found : {6, 6, 7, 0, 0})
+        step(found, 0);
     for (int i = 0; i < 10; ++i)
-        given.push_back(step(RC_ACT_VOLUME_UP, kT0 + i * 50'000));
-    EXPECT_EQ(given, (std::vector<RcAction>{9, 9, -1, -1, -1, 9, -1, -1, -1, 9}));
-    const std::int64_t last = s.lastRepeatTime;
-    EXPECT_EQ(step(RC_ACT_VOLUME_UP, last + 199'999), -1);
-    EXPECT_EQ(step(RC_ACT_VOLUME_UP, last + 200'000), 9);
-    EXPECT_EQ(step(RC_ACT_VOLUME_UP, last - 1), 9);  // a clock set back: a large unsigned gap
+        step(RC_ACT_VOLUME_UP, 1'700'000'000'000'000 + i * 50'000);
+    const std::int64_t last = state.lastRepeatTime;
+    for (const std::int64_t now : {last + 199'999, last + 200'000, last - 1})
+        step(RC_ACT_VOLUME_UP, now);
+    EXPECT_EQ(given, (std::vector<RcAction> {6, -1, 7, 0, -1, 9, 9, -1, -1, -1, 9, -1, -1, -1, 9, -1, 9, 9}));
 }
-
-// The driver reading a FIFO at its device path; the test keeps a writer
-// open (a FIFO without one reads as end of file).
-class AirclickFifo : public ::testing::Test {
-protected:
-    void SetUp() override
-    {
-        AirclickClose();
-        AirclickRepeat = {0, 0};
-        unlink(kDevice);
-        ASSERT_EQ(mkfifo(kDevice, 0600), 0);
-        writer_ = open(kDevice, O_RDWR | O_CLOEXEC);
-        ASSERT_EQ(AirclickOpen(), 0);
-    }
-    void TearDown() override
-    {
-        AirclickClose();
-        close(writer_);
-        unlink(kDevice);
-    }
-    void Write(const Bytes& r) { ASSERT_EQ(write(writer_, r.data(), r.size()), static_cast<ssize_t>(r.size())); }
-    int Pending()
-    {
-        int n = 0;
-        ioctl(writer_, FIONREAD, &n);
-        return n;
-    }
-    // Writes each report once the driver has taken the one before, as a
-    // remote sends them while a button is held.
-    std::thread Feed(std::vector<Bytes> reports)
-    {
-        return std::thread([this, reports] {
-            for (const Bytes& r : reports) {
-                vt::WaitUntil([&] { return Pending() == 0; }, 5000);
-                (void)!write(writer_, r.data(), r.size());
-            }
-        });
-    }
-    int writer_ = -1;
-};
-
-TEST_F(AirclickFifo, RepeatsOfAHeldButtonAreDroppedUntilItsRelease)
-{
-    Write(Report(kPlay));
-    EXPECT_EQ(AirclickRead(), RC_ACT_PLAY);
-    // A repeat is dropped: the read gives nothing.
-    Write(Report(kPlay));
-    EXPECT_EQ(AirclickRead(), 0);
-    EXPECT_EQ(Pending(), 0);
-
-    // One report per read: each repeat gives 0 at once, so does the release;
-    // then Play counts again.
-    std::thread feeder = Feed({Report(kPlay), Report(kPlay), Report(kRelease), Report(kPlay)});
-    std::vector<std::int32_t> reads;
-    for (int i = 0; i < 4; ++i)
-        reads.push_back(AirclickRead());
-    feeder.join();
-    EXPECT_EQ(reads, (std::vector<std::int32_t>{0, 0, 0, RC_ACT_PLAY}));
-
-    // A held volume button repeats at once, stamped with the time of day.
-    Write(Report(kVolumePlus));
-    EXPECT_EQ(AirclickRead(), RC_ACT_VOLUME_UP);
-    timeval before {};
-    gettimeofday(&before, nullptr);
-    Write(Report(kVolumePlus));
-    EXPECT_EQ(AirclickRead(), RC_ACT_VOLUME_UP);
-    EXPECT_GE(AirclickRepeat.lastRepeatTime, std::int64_t{before.tv_sec} * 1000000 + before.tv_usec);
-}
-
-TEST_F(AirclickFifo, BadReadsAndAFailedOpenAreLoggedAndLeaveTheStateAlone)
-{
-    vt::SyslogSink log;
-    Write(Report(kPlay));
-    ASSERT_EQ(AirclickRead(), RC_ACT_PLAY);
-    Write(Bytes(4, 0xFA));
-    EXPECT_EQ(AirclickRead(), -1);
-    close(writer_);  // without a writer the FIFO reads as end of file
-    writer_ = -1;
-    EXPECT_EQ(AirclickRead(), -1);
-    EXPECT_EQ(AirclickRepeat.lastAction, RC_ACT_PLAY);
-
-    // A directory opens for reading but cannot be read.
-    AirclickClose();
-    unlink(kDevice);
-    ASSERT_EQ(mkdir(kDevice, 0755), 0);
-    ASSERT_EQ(AirclickOpen(), 0);
-    EXPECT_EQ(AirclickRead(), -1);
-    AirclickClose();
-    rmdir(kDevice);
-    EXPECT_EQ(AirclickOpen(), -1);
-    ASSERT_TRUE(log.WaitFor("(123)"));
-    EXPECT_EQ(log.Lines(), (std::vector<std::string>{
-        "hw_airclick.cpp (205) Got short read from device!", "hw_airclick.cpp (205) Got short read from device!",
-        "hw_airclick.cpp (203) Error reading event.",
-        "hw_airclick.cpp (123) failed to open /dev/usb/hiddev1 (No such file or directory)."}));
-}
-
-TEST_F(AirclickFifo, NotInTheDaemonsTableButReadyForOne)
-{
-    EXPECT_EQ(RcDriversFind("airclick"), nullptr);
-    RcDriver* const table[] = {&airclick, nullptr};
-    const std::int32_t fd = airclick.descriptor;
-    EXPECT_EQ(RcDriversOpenAll(table), 0);  // a second open keeps the descriptor it has
-    EXPECT_EQ(airclick.descriptor, fd);
-    Write(Report(kPlay));
-    EXPECT_EQ(RcDriversPoll(table), RC_ACT_PLAY);
-    EXPECT_EQ(RcDriversCloseAll(table), 0);
-    EXPECT_EQ(airclick.descriptor, -1);
-    EXPECT_EQ(fcntl(fd, F_GETFD), -1);
-    EXPECT_EQ(AirclickRead(), 0);  // closed: nothing, at once
-}
-
-}  // namespace

@@ -1,0 +1,120 @@
+// The daemon among its peers, each of them the stand-in program itself: the
+// audio daemon (standin-audiod), the radio remote (remote-sim, writing into a
+// FIFO at the receiver's device path), the media-center interface
+// (standin-mediacenter) and a local program (vexorctl). On the PowerPC build
+// they all run big-endian, as on the target.
+#include <filesystem>
+#include <optional>
+
+#include "harness.hpp"
+
+namespace {
+
+// The daemon stops within its receiver's wait and an exchange under way, and room for the emulator.
+constexpr int STOP_MS = 200 + 500 + 2000;
+
+int Remote(std::vector<std::string> script)
+{
+    script.insert(script.begin(), "remote-sim");
+    return vt::Run(script);
+}
+
+class Peers : public ::testing::Test {
+protected:
+    // The audio daemon's stand-in, the remote's FIFO and the daemon.
+    void Start(const std::vector<std::string>& audiod = {"standin-audiod"})
+    {
+        vt::Logged();
+        audiod_.emplace(audiod);
+        ASSERT_TRUE(audiod_->Expect("standin-audiod: listening on /tmp/vexoaudiod.sock"));
+        remote_.emplace(std::vector<std::string> {"remote-sim", "--stay"});  // holds the FIFO open
+        ASSERT_TRUE(remote_->Expect(std::string("ready ") + RC_RAYTAC_DEVICE_PATH));
+        ASSERT_GT(daemon_.emplace().pid, 0);
+    }
+    // It logs nothing that the test's fault does not explain.
+    void TearDown() override
+    {
+        if (daemon_ && daemon_->pid > 0) {
+            EXPECT_EQ(daemon_->Stop(SIGTERM, STOP_MS), 0);
+        }
+        for (const std::string& line : vt::Logged())
+            EXPECT_TRUE(std::count(allowed_.begin(), allowed_.end(), line)) << "unexpected log line: " << line;
+    }
+    // The next command the audio daemon received.
+    std::string Next()
+    {
+        std::string line;
+        return audiod_->Line(line, 3000) ? line : "(nothing)";
+    }
+    bool HoldsReceiver() const
+    {
+        std::error_code error;
+        for (const auto& fd : std::filesystem::directory_iterator("/proc/" + std::to_string(daemon_->pid) + "/fd", error))
+            if (std::filesystem::read_symlink(fd, error) == RC_RAYTAC_DEVICE_PATH)
+                return true;
+        return false;
+    }
+    std::optional<vt::Program> audiod_, remote_;
+    std::optional<vt::Daemon> daemon_;
+    std::vector<std::string> allowed_;  // log lines that the test's fault explains
+};
+
+TEST_F(Peers, AListeningMediaCenterTakesTheKeysAndAFrozenOneHoldsNothingUp)
+{
+    Start();
+    {
+        vt::Program ui({"standin-mediacenter"});
+        ASSERT_TRUE(ui.Expect("listening /tmp/MediaCenter.sock"));
+        ASSERT_EQ(Remote({"tap", "Play"}), 0);
+        EXPECT_TRUE(ui.Expect("key 0x0007002C"));
+    }
+    ASSERT_EQ(vt::Run({"vexorctl", "stop"}), 0);
+    EXPECT_EQ(Next(), "AUDIO_CMD_STOP (5)");  // the Play went to the interface alone
+    vt::Program frozen({"standin-mediacenter", "--frozen"});  // its queue takes ten keys
+    ASSERT_TRUE(frozen.Expect("frozen /tmp/MediaCenter.sock"));
+    std::vector<std::string> taps;
+    for (int i = 0; i < 12; ++i)
+        taps.insert(taps.end(), {"tap", "Play"});
+    ASSERT_EQ(Remote(taps), 0);
+    EXPECT_EQ(Next(), "AUDIO_CMD_PLAY (4)");  // the daemon acts on the others itself
+}
+
+TEST_F(Peers, AnAudioDaemonThatHangsHoldsNothingUp)
+{
+    // Not answering, or not accepting: five connections fit its queue, the connects after them give
+    // up (or end when the daemon stops). Actions are taken and keys read all along, and the daemon
+    // stops promptly with an exchange under way.
+    const std::string failed = "ctrl.cpp:27 Failed to connect to /tmp/vexoaudiod.sock. [";
+    allowed_ = {failed + "Resource temporarily unavailable]", failed + "Interrupted system call]"};
+    for (const char* mode : {"--never-answer", "--stop-accepting"}) {
+        Start({"standin-audiod", mode});
+        for (int i = 0; i < 6; ++i)
+            ASSERT_EQ(vt::Run({"vexorctl", "play"}), 0) << mode << ": action " << i << " was not taken";
+        ASSERT_EQ(Remote({"tap", "Stop"}), 0);
+        ASSERT_EQ(vt::Run({"vexorctl", "play"}), 0);
+        EXPECT_EQ(daemon_->Stop(SIGTERM, STOP_MS), 0) << mode;
+    }
+}
+
+TEST_F(Peers, HotplugSignalsCloseAndReopenTheReceiverAndAKeyLeftDownStaysQuiet)
+{
+    Start();
+    ASSERT_EQ(Remote({"hold", "Next", "1200", "press", "Volume Plus"}), 0);
+    EXPECT_EQ(Next(), "AUDIO_CMD_NEXT_HELD (33)");  // on the fourth 200 ms wait
+    EXPECT_EQ(Next(), "AUDIO_CMD_VOLUME_UP (12)");
+    EXPECT_EQ(Next(), "AUDIO_CMD_VOLUME_UP (12)");  // repeated while held
+    kill(daemon_->pid, SIGUSR2);
+    ASSERT_TRUE(vt::WaitUntil([&] { return !HoldsReceiver(); }));
+    ASSERT_EQ(vt::Run({"vexorctl", "stop"}), 0);
+    std::string line;
+    while ((line = Next()) == "AUDIO_CMD_VOLUME_UP (12)") {
+    }
+    EXPECT_EQ(line, "AUDIO_CMD_STOP (5)");
+    kill(daemon_->pid, SIGUSR1);
+    ASSERT_TRUE(vt::WaitUntil([&] { return HoldsReceiver(); }));
+    // Its release never came, but the reopened receiver has forgotten the key.
+    ASSERT_EQ(Remote({"sleep", "600", "release", "Volume Plus", "tap", "Stop"}), 0);
+    EXPECT_EQ(Next(), "AUDIO_CMD_STOP (5)");
+}
+
+}  // namespace
