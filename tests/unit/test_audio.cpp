@@ -61,7 +61,9 @@ std::string Wire(std::int32_t code, const std::string& arg)
 TEST(AudioExchange, OneRecordOutAndOneAnswerInWithinTheBudget)
 {
     vt::Logged();
-    const std::string cleared(32, '\0'), untouched(32, 'x'), one = "r" + cleared.substr(1);
+    const std::string cleared(32, '\0'), untouched(32, 'x');
+    std::string one = cleared;
+    one[0] = 'r';
     const struct {  // the peer and what it does, what the exchange gives, how long it takes, what it leaves
         bool peer; std::size_t answer; int delayMs, result, minMs, maxMs; std::string reply; std::vector<std::string> log;
     } rows[] = {
