@@ -14,8 +14,8 @@ TEST(Lifecycle, AnyArgumentPrintsTheUsageAndTouchesNothing)
     for (const char* arg : {"-h", "start"}) {
         std::string out;
         EXPECT_EQ(vt::Run({"vexorcd", arg}, &out), 0);
-        const auto banner = out.find('\n');  // a banner line, an empty line, the usage line
-        EXPECT_EQ(out.substr(std::min(banner, out.size())), "\n\n" + vt::Bin("vexorcd") + ":\tVexora remote controller daemon.\n");
+        const auto banner = std::min(out.find('\n'), out.size());  // a banner, an empty line, the usage
+        EXPECT_EQ(out.substr(banner), "\n\n" + vt::Bin("vexorcd") + ":\tVexora remote controller daemon.\n");
         EXPECT_FALSE(Exists(RC_PID_FILE));
     }
     EXPECT_TRUE(vt::Logged().empty());
@@ -54,8 +54,8 @@ TEST(Lifecycle, APidFileOfNoLiveProcessIsReplacedAndOneThatCannotBeWrittenIsLogg
     vt::Daemon daemon;  // it serves all the same
     EXPECT_GT(daemon.pid, 0);
     EXPECT_EQ(daemon.Stop(), 0);
-    EXPECT_EQ(vt::Logged(), std::vector<std::string> {
-                                "vexorcd.cpp (119) Failed to write vexorcd pid [/var/run/vexorcd.pid]. (Is a directory)"});
+    EXPECT_EQ(vt::Logged(), std::vector<std::string> {"vexorcd.cpp (119) Failed to write vexorcd pid "
+                                                      "[/var/run/vexorcd.pid]. (Is a directory)"});
     rmdir(RC_PID_FILE);
 }
 

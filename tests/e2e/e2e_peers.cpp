@@ -49,7 +49,8 @@ protected:
     bool HoldsReceiver() const
     {
         std::error_code error;
-        for (const auto& fd : std::filesystem::directory_iterator("/proc/" + std::to_string(daemon_->pid) + "/fd", error))
+        const std::string fds = "/proc/" + std::to_string(daemon_->pid) + "/fd";
+        for (const auto& fd : std::filesystem::directory_iterator(fds, error))
             if (std::filesystem::read_symlink(fd, error) == RC_RAYTAC_DEVICE_PATH)
                 return true;
         return false;

@@ -49,6 +49,7 @@ inline std::string ReadFile(const std::string& path)
     return text.str();
 }
 inline void WriteFile(const std::string& path, const std::string& text) { std::ofstream(path) << text; }
+inline std::string Bin(const std::string& name) { return VEXO_BIN_DIR "/" + name; }
 
 // A Unix socket connected to path, or bound there in place of what stood there; -1 on failure.
 inline int UnixSocket(const char* path, int type, bool bound = false)
@@ -64,7 +65,6 @@ inline int UnixSocket(const char* path, int type, bool bound = false)
     return -1;
 }
 
-inline std::string Bin(const std::string& name) { return VEXO_BIN_DIR "/" + name; }
 inline std::set<pid_t> started;  // programs not yet reaped: never taken for the daemon
 
 // A program of the build (argv[0] is its name), its output and errors on a
@@ -186,7 +186,8 @@ struct Daemon {
     int Stop(int sig = SIGTERM, int ms = 5000)
     {
         int status = -1;
-        if (pid > 0 && kill(pid, sig) == 0 && !WaitUntil([&] { return waitpid(pid, &status, WNOHANG) == pid; }, ms)) {
+        const auto ended = [&] { return waitpid(pid, &status, WNOHANG) == pid; };
+        if (pid > 0 && kill(pid, sig) == 0 && !WaitUntil(ended, ms)) {
             ADD_FAILURE() << "vexorcd did not stop within " << ms << " ms";
             kill(pid, SIGKILL);
             waitpid(pid, &status, 0);

@@ -30,8 +30,10 @@ public:
             pollfd ready {listener_, POLLIN, 0};
             const int fd = poll(&ready, 1, 2000) == 1 ? accept(listener_, nullptr, nullptr) : -1;
             char chunk[4096];
-            for (ssize_t n = 0; fd >= 0 && record_.size() < sizeof(AudioCmdRecord) && (n = read(fd, chunk, sizeof chunk)) > 0;)
-                record_.append(chunk, static_cast<std::size_t>(n));
+            ssize_t n = 1;
+            while (fd >= 0 && n > 0 && record_.size() < sizeof(AudioCmdRecord))
+                if ((n = read(fd, chunk, sizeof chunk)) > 0)
+                    record_.append(chunk, static_cast<std::size_t>(n));
             std::this_thread::sleep_for(std::chrono::milliseconds(fd >= 0 ? delayMs : 0));
             send(fd, std::string(answer, 'r').data(), answer, MSG_NOSIGNAL);
             close(fd);
@@ -64,8 +66,12 @@ TEST(AudioExchange, OneRecordOutAndOneAnswerInWithinTheBudget)
     const std::string cleared(32, '\0'), untouched(32, 'x');
     std::string one = cleared;
     one[0] = 'r';
-    const struct {  // the peer and what it does, what the exchange gives, how long it takes, what it leaves
-        bool peer; std::size_t answer; int delayMs, result, minMs, maxMs; std::string reply; std::vector<std::string> log;
+    const struct {  // the peer and what it does, what the exchange gives, takes and leaves
+        bool peer;
+        std::size_t answer;
+        int delayMs, result, minMs, maxMs;
+        std::string reply;
+        std::vector<std::string> log;
     } rows[] = {
         {true, 1, 0, 0, 0, 400, one, {}},  // the rest of the buffer is cleared
         {true, 100, 0, 0, 0, 400, std::string(32, 'r'), {}},

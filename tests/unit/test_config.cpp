@@ -31,15 +31,17 @@ std::string Got(Call call)
 TEST(EqProfile, TheFirstLineWhoseNameBeginsTheRequestAnswersSplitAtItsLastColon)
 {
     vt::Logged();
-    const std::string rock = "Rock: 1 2 3 \nRock Live:4 5 6\nJazz:Club:7 8\n", long1023 = "Long:" + std::string(1018, 'a');
-    for (const auto& [text, name, outSize, result] : {
-             std::tuple {rock, "Rock Live", 64, "11 2 3"}, {rock, "Jazz:Club", 64, "17 8"}, {rock, "Jazz", 64, "0-"},
-             {rock, "rock", 64, "0-"}, {"", "Rock", 64, "0-"}, {rock, "Rock", 4, "11"},  // cut to " 1 ", trimmed
-             {"Rock:1\n\nPop:2\n", "Rock", 64, "11"},  // the search ends at the match
-             {"Rock:1\nPop", "Pop", 64, "-1-"},        // a line without ':' ends it
-             {long1023 + "Tail:b\n", "Tail", 64, "1b"}, {long1023 + "\nQ:y\n", "Q", 64, "-1-"}}) {
-        Place("/tmp/profiles", text.c_str());  // a longer line comes in pieces of 1023
-        EXPECT_EQ(Got([&](char* out) { return AudioEqLookupProfile("/tmp/profiles", name, out, outSize); }), result) << name;
+    const std::string rock = "Rock: 1 2 3 \nRock Live:4 5 6\nJazz:Club:7 8\n";
+    const std::string piece = "Long:" + std::string(1018, 'a');  // lines are read in pieces of 1023
+    for (const auto& [text, name, outSize, result] :
+         {std::tuple {rock, "Rock Live", 64, "11 2 3"}, {rock, "Jazz:Club", 64, "17 8"}, {rock, "Jazz", 64, "0-"},
+          {rock, "rock", 64, "0-"}, {"", "Rock", 64, "0-"}, {rock, "Rock", 4, "11"},  // cut to " 1 ", trimmed
+          {"Rock:1\n\nPop:2\n", "Rock", 64, "11"},                                    // ends at the match
+          {"Rock:1\nPop", "Pop", 64, "-1-"},  // a line without ':' ends it
+          {piece + "Tail:b\n", "Tail", 64, "1b"}, {piece + "\nQ:y\n", "Q", 64, "-1-"}}) {
+        Place("/tmp/profiles", text.c_str());
+        EXPECT_EQ(Got([&](char* out) { return AudioEqLookupProfile("/tmp/profiles", name, out, outSize); }),
+                  result) << name;
     }
     EXPECT_EQ(Got([](char* out) { return AudioEqLookupProfile("/tmp/none", "Rock", out, 8); }), "-1-");
     EXPECT_EQ(vt::Logged(), (std::vector<std::string> {"ctrl.cpp:546 The EQ profile [Pop] is illegal.",
@@ -49,32 +51,37 @@ TEST(EqProfile, TheFirstLineWhoseNameBeginsTheRequestAnswersSplitAtItsLastColon)
 TEST(EqProfile, TheDefaultNeedsExactlyYesAndComesFromTheSystemFileBeforeTheUsers)
 {
     vt::Logged();
-    const char* on = "audio_enable_equalizer=yes\naudio_default_equalizer=Rock Live\n";
-    for (const auto& [conf, system, user, result] : {  // null: the file is missing
-             std::tuple<const char*, const char*, const char*, const char*> {
-                 "audio_enable_equalizer=Yes\naudio_default_equalizer=Rock\n", "Rock:s\n", "", "0-"},
-             {"audio_enable_equalizer=\"yes \"\naudio_default_equalizer=Rock\n", "Rock:s\n", "", "0-"},
-             {"audio_enable_equalizer=yes\n", "Rock:s\n", "", "0-"}, {nullptr, "Rock:s\n", "", "0-"},
+    const auto conf = [](const char* enable, const char* name) {
+        return std::string("audio_enable_equalizer=") + enable + "\naudio_default_equalizer=" + name + "\n";
+    };
+    const std::string on = conf("yes", "Rock Live");
+    using Row = std::tuple<std::string, const char*, const char*, const char*>;
+    for (const auto& [text, system, user, result] : {  // null: the file is missing
+             Row {conf("Yes", "Rock"), "R:s\n", "", "0-"},
+             {conf("\"yes \"", "Rock"), "R:s\n", "", "0-"}, {"", "R:s\n", "", "0-"},
              {on, "Pop:1\nRock:system\n", "Rock:user\n", "1system"}, {on, "Pop:1\n", "Rock:user\n", "1user"},
-             {on, "Pop:1\n", "Jazz:1\n", "0-"}, {on, "Pop:1\n", nullptr, "-1-"},  // silently
+             {on, "Pop:1\n", "", "0-"}, {on, "Pop:1\n", nullptr, "-1-"},  // silently
              {on, "Pop\nRock:system\n", "Rock:user\n", "-1-"}, {on, nullptr, "Rock:user\n", "-1-"}}) {
-        Place(VEXO_AUDIO_CONF_PATH, conf);
+        Place(VEXO_AUDIO_CONF_PATH, text.c_str());
         Place(AUDIO_EQ_SYSTEM_FILE, system);
         Place(AUDIO_EQ_USER_FILE, user);
-        EXPECT_EQ(Got([](char* out) { return AudioEqGetDefault(out, 256); }), result) << (conf ? conf : "") << (system ? system : "");
+        EXPECT_EQ(Got([](char* out) { return AudioEqGetDefault(out, 256); }), result) << text;
     }
-    const std::string failed = "ctrl.cpp:603 Failed to open the system EQ profile [" + std::string(AUDIO_EQ_SYSTEM_FILE) + "].";
-    EXPECT_EQ(vt::Logged(), (std::vector<std::string> {"ctrl.cpp:546 The EQ profile [Pop", "] is illegal.", failed, failed}));
+    const std::string failed = "ctrl.cpp:603 Failed to open the system EQ profile [" +
+                               std::string(AUDIO_EQ_SYSTEM_FILE) + "].";
+    EXPECT_EQ(vt::Logged(),
+              (std::vector<std::string> {"ctrl.cpp:546 The EQ profile [Pop", "] is illegal.", failed, failed}));
 }
 
 TEST(Vlibc, TheConfigurationStoreThePidFileAndLiveness)
 {
-    Place(VEXO_AUDIO_CONF_PATH, ("# on=no\n  on = yes \t\nname=\" Rock Live \"\nmixed=\"a'\ncrlf=value\r\nx=1\nx=2\n"
-                                 "equals=a=b\nCase=upper\nlong=" + std::string(1200, 'v') + "\nlast=no newline").c_str());
-    for (const auto& [key, size, result] : {
-             std::tuple {"on", 1024, "1yes"}, {"name", 1024, "1 Rock Live "}, {"mixed", 1024, "1\"a'"},
-             {"crlf", 1024, "1value"}, {"x", 1024, "12"}, {"equals", 1024, "1a=b"}, {"last", 1024, "1no newline"},
-             {"case", 1024, "0-"}, {"# on", 1024, "0-"}, {"on", 4, "1yes"}, {"on", 3, "-1-"}, {"long", 1024, "-1-"}})
+    const std::string store = "# on=no\n  on = yes \t\nname=\" Rock Live \"\nmixed=\"a'\ncrlf=value\r\nx=1\nx=2\n"
+                              "equals=a=b\nCase=upper\nlong=" + std::string(1200, 'v') + "\nlast=no newline";
+    Place(VEXO_AUDIO_CONF_PATH, store.c_str());
+    for (const auto& [key, size, result] :
+         {std::tuple {"on", 1024, "1yes"}, {"name", 1024, "1 Rock Live "}, {"mixed", 1024, "1\"a'"},
+          {"crlf", 1024, "1value"}, {"x", 1024, "12"}, {"equals", 1024, "1a=b"}, {"last", 1024, "1no newline"},
+          {"case", 1024, "0-"}, {"# on", 1024, "0-"}, {"on", 4, "1yes"}, {"on", 3, "-1-"}, {"long", 1024, "-1-"}})
         EXPECT_EQ(Got([&](char* out) { return VEXOAudioConfGet(key, out, size); }), result) << key << " " << size;
     for (const auto& [text, pid] : {std::pair {"1234", 1234}, {" 77 \n", 77}, {"2147483648", 0}, {"12ab", 0},
                                     {"-5", 0}, {"0", 0}, {"000000000000000000000000000000001", 0}}) {

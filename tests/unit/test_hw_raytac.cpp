@@ -43,7 +43,8 @@ TEST(RaytacStep, EveryKeyAtItsPressWhileHeldAndAtItsRelease)
             for (const char* e = s[0]; *e != '\0'; ++e) {
                 const RaytacHandOver h =
                     RaytacStep(state, {*e == '.', {key.code, *e == 'p' ? 1 : *e == 'x' ? 2 : 0}});
-                const char c = h.action == 0 ? 'n' : h.action == key.action ? 'a' : h.action == key.held ? 'h' : '?';
+                const char c =
+                    h.action == 0 ? 'n' : h.action == key.action ? 'a' : h.action == key.held ? 'h' : '?';
                 got += !h.offer ? c : h.code == key.code ? static_cast<char>(std::toupper(c)) : '!';
             }
             EXPECT_EQ(got, s[key.held > 0 ? 3 : key.held < 0 ? 2 : 1]) << std::hex << key.code << " " << s[0];

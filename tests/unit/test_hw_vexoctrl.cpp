@@ -11,10 +11,10 @@ namespace {
 
 std::string Bytes(std::int32_t v) { return std::string(reinterpret_cast<const char*>(&v), 4); }
 std::vector<std::int32_t> Slots() { return {CtrlSockClients, CtrlSockClients + CTRL_SOCK_SLOTS}; }
-// A client that has sent bytes, and hung up when told to.
+// A client that has sent bytes, and hung up when told to; it never waits for a full queue.
 int Client(const std::string& bytes = "", bool hangUp = false)
 {
-    const int fd = vt::UnixSocket(RC_CTRL_SOCKET_PATH, SOCK_STREAM);
+    const int fd = vt::UnixSocket(RC_CTRL_SOCKET_PATH, SOCK_STREAM | SOCK_NONBLOCK);
     EXPECT_EQ(write(fd, bytes.data(), bytes.size()), static_cast<ssize_t>(bytes.size()));
     if (hangUp)
         shutdown(fd, SHUT_WR);
