@@ -3,10 +3,10 @@
 // FIFO at the receiver's device path), the media-center interface
 // (standin-mediacenter) and a local program (vexorctl). On the PowerPC build
 // they all run big-endian, as on the target.
-#include <filesystem>
 #include <optional>
 
 #include "harness.hpp"
+#include "lib/proc_fds.hpp"
 
 namespace {
 
@@ -45,15 +45,6 @@ protected:
     {
         std::string line;
         return audiod_->Line(line, 3000) ? line : "(nothing)";
-    }
-    bool HoldsReceiver() const
-    {
-        std::error_code error;
-        const std::string fds = "/proc/" + std::to_string(daemon_->pid) + "/fd";
-        for (const auto& fd : std::filesystem::directory_iterator(fds, error))
-            if (std::filesystem::read_symlink(fd, error) == RC_RAYTAC_DEVICE_PATH)
-                return true;
-        return false;
     }
     std::optional<vt::Program> audiod_, remote_;
     std::optional<vt::Daemon> daemon_;
@@ -105,14 +96,14 @@ TEST_F(Peers, HotplugSignalsCloseAndReopenTheReceiverAndAKeyLeftDownStaysQuiet)
     EXPECT_EQ(Next(), "AUDIO_CMD_VOLUME_UP (12)");
     EXPECT_EQ(Next(), "AUDIO_CMD_VOLUME_UP (12)");  // repeated while held
     kill(daemon_->pid, SIGUSR2);
-    ASSERT_TRUE(vt::WaitUntil([&] { return !HoldsReceiver(); }));
+    ASSERT_TRUE(ProcWaitHoldsOpen(daemon_->pid, RC_RAYTAC_DEVICE_PATH, false, 5000));
     ASSERT_EQ(vt::Run({"vexorctl", "stop"}), 0);
     std::string line;
     while ((line = Next()) == "AUDIO_CMD_VOLUME_UP (12)") {
     }
     EXPECT_EQ(line, "AUDIO_CMD_STOP (5)");
     kill(daemon_->pid, SIGUSR1);
-    ASSERT_TRUE(vt::WaitUntil([&] { return HoldsReceiver(); }));
+    ASSERT_TRUE(ProcWaitHoldsOpen(daemon_->pid, RC_RAYTAC_DEVICE_PATH, true, 5000));
     // Its release never came, but the reopened receiver has forgotten the key.
     ASSERT_EQ(Remote({"sleep", "600", "release", "Volume Plus", "tap", "Stop"}), 0);
     EXPECT_EQ(Next(), "AUDIO_CMD_STOP (5)");

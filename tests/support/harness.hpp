@@ -7,6 +7,7 @@
 #include <fcntl.h>
 #include <poll.h>
 #include <sys/prctl.h>
+#include <sys/socket.h>
 #include <sys/wait.h>
 #include <syslog.h>
 #include <unistd.h>
@@ -20,7 +21,8 @@
 
 #include <gtest/gtest.h>
 
-#include "common/socket.hpp"
+#include "common/paths.hpp"
+#include "lib/unix_socket.hpp"
 
 namespace vt {
 
@@ -50,20 +52,6 @@ inline std::string ReadFile(const std::string& path)
 }
 inline void WriteFile(const std::string& path, const std::string& text) { std::ofstream(path) << text; }
 inline std::string Bin(const std::string& name) { return VEXO_BIN_DIR "/" + name; }
-
-// A Unix socket connected to path, or bound there in place of what stood there; -1 on failure.
-inline int UnixSocket(const char* path, int type, bool bound = false)
-{
-    sockaddr_un addr;
-    const int fd = socket(AF_UNIX, type | SOCK_CLOEXEC, 0);
-    const auto* a = reinterpret_cast<const sockaddr*>(&addr);
-    if (bound)
-        unlink(path);
-    if (SocketFillAddress(addr, path) && (bound ? bind(fd, a, sizeof addr) : connect(fd, a, sizeof addr)) == 0)
-        return fd;
-    close(fd);
-    return -1;
-}
 
 inline std::set<pid_t> started;  // programs not yet reaped: never taken for the daemon
 

@@ -1,54 +1,44 @@
-// The audio daemon client against a peer of the test's own on the audio
-// daemon's socket: the exchange and its faults, every argument form byte for
-// byte, the refusals, and the command each remote action sends.
+// The audio daemon client against the tools' stand-in audio daemon, run on a
+// thread: the exchange and its faults, every argument form byte for byte, the
+// refusals, and the command each remote action sends.
 #include <climits>
-#include <thread>
 #include <cstring>
+#include <mutex>
 #include <optional>
 
 #include "audioctl/ctrl.hpp"
 #include "audioctl/playlist.hpp"
 #include "harness.hpp"
+#include "lib/audio_peer.hpp"
 #include "vexorcd/dispatch.hpp"
 
 namespace {
 
 const std::string NO_PEER = "ctrl.cpp:27 Failed to connect to /tmp/vexoaudiod.sock. [No such file or directory]";
 
-// The far end of one exchange, in a thread: takes the record, then after
-// delayMs answers `answer` bytes, or hangs up without a word when answer is 0.
+// The tools' stand-in audio daemon on a thread, in a mode, keeping each record it takes.
 class Peer {
-    int listener_ = vt::UnixSocket(AUDIO_SOCKET_PATH, SOCK_STREAM, true);
-    std::string record_;
-    std::thread thread_;
+    std::mutex mu_;
+    std::string records_;
+    AudioPeer peer_;  // stopped before the records go
 
 public:
-    explicit Peer(std::size_t answer = 1, int delayMs = 0)
+    explicit Peer(AudioPeerMode mode = AudioPeerMode::Answer, int delayMs = 0)
     {
-        listen(listener_, 4);
-        thread_ = std::thread([this, answer, delayMs] {
-            pollfd ready {listener_, POLLIN, 0};
-            const int fd = poll(&ready, 1, 2000) == 1 ? accept(listener_, nullptr, nullptr) : -1;
-            char chunk[4096];
-            ssize_t n = 1;
-            while (fd >= 0 && n > 0 && record_.size() < sizeof(AudioCmdRecord))
-                if ((n = read(fd, chunk, sizeof chunk)) > 0)
-                    record_.append(chunk, static_cast<std::size_t>(n));
-            std::this_thread::sleep_for(std::chrono::milliseconds(fd >= 0 ? delayMs : 0));
-            send(fd, std::string(answer, 'r').data(), answer, MSG_NOSIGNAL);
-            close(fd);
+        std::string error;
+        EXPECT_TRUE(peer_.Listen(&error)) << error;
+        peer_.SetMode(mode, delayMs);
+        peer_.SetObserver([this](const AudioPeerRecord& seen) {
+            const std::lock_guard<std::mutex> lock(mu_);
+            records_.append(reinterpret_cast<const char*>(&seen.record), seen.bytes);
         });
+        EXPECT_TRUE(peer_.Start());
     }
-    ~Peer() { Record(); }
-    // What it received; empty when nobody came.
-    const std::string& Record()
+    // The bytes of the records it took so far.
+    std::string Records()
     {
-        if (thread_.joinable()) {
-            thread_.join();
-            close(listener_);
-            unlink(AUDIO_SOCKET_PATH);
-        }
-        return record_;
+        const std::lock_guard<std::mutex> lock(mu_);
+        return records_;
     }
 };
 
@@ -64,32 +54,32 @@ TEST(AudioExchange, OneRecordOutAndOneAnswerInWithinTheBudget)
 {
     vt::Logged();
     const std::string cleared(32, '\0'), untouched(32, 'x');
-    std::string one = cleared;
-    one[0] = 'r';
-    const struct {  // the peer and what it does, what the exchange gives, takes and leaves
-        bool peer;
-        std::size_t answer;
+    std::string ok = cleared;
+    ok.replace(0, 2, "ok");
+    using Mode = AudioPeerMode;
+    const struct {  // the peer (if any) and its delay, and what the exchange gives, takes and leaves
+        std::optional<Mode> mode;
         int delayMs, result, minMs, maxMs;
         std::string reply;
         std::vector<std::string> log;
     } rows[] = {
-        {true, 1, 0, 0, 0, 400, one, {}},  // the rest of the buffer is cleared
-        {true, 100, 0, 0, 0, 400, std::string(32, 'r'), {}},
-        {true, 1, 200, 0, 150, 450, one, {}},           // late, within the budget
-        {true, 0, 1500, -1, 480, 1000, untouched, {}},  // silent: given up after the budget
-        {true, 0, 0, -1, 0, 400, cleared, {"ctrl.cpp:90 Failed to read action [Success]"}},
-        {false, 0, 0, -1, 0, 400, untouched, {NO_PEER}},
+        {Mode::Answer, 0, 0, 0, 400, ok, {}},  // the rest of the buffer is cleared
+        {Mode::AnswerHuge, 0, 0, 0, 400, std::string(32, 'h'), {}},
+        {Mode::AnswerLate, 200, 0, 150, 450, ok, {}},         // within the budget
+        {Mode::NeverAnswer, 0, -1, 480, 1000, untouched, {}},  // given up after the budget
+        {Mode::CloseWithoutAnswer, 0, -1, 0, 400, cleared, {"ctrl.cpp:90 Failed to read action [Success]"}},
+        {std::nullopt, 0, -1, 0, 400, untouched, {NO_PEER}},
     };
     for (const auto& r : rows) {
         std::optional<Peer> peer;
-        if (r.peer)
-            peer.emplace(r.answer, r.delayMs);
+        if (r.mode)
+            peer.emplace(*r.mode, r.delayMs);
         char reply[40];
         std::memset(reply, 'x', sizeof reply);
         const auto start = std::chrono::steady_clock::now();
         EXPECT_EQ(AudioCtrlTransact(AudioCmdRecord {}, reply, 32), r.result);
         const auto ms = (std::chrono::steady_clock::now() - start) / std::chrono::milliseconds(1);
-        EXPECT_TRUE(ms >= r.minMs && ms < r.maxMs) << ms << " ms for " << r.answer << " after " << r.delayMs;
+        EXPECT_TRUE(ms >= r.minMs && ms < r.maxMs) << ms << " ms for a result of " << r.result;
         EXPECT_EQ(std::string(reply, sizeof reply), r.reply + "xxxxxxxx");
         EXPECT_EQ(vt::Logged(), r.log);
     }
@@ -120,7 +110,7 @@ TEST(AudioForms, EveryArgumentFormArrivesByteForByteAndRefusalsSendNothing)
         EXPECT_EQ(send(), 0);
         std::int32_t code;
         std::memcpy(&code, wire.data(), 4);
-        EXPECT_TRUE(peer.Record() == wire) << "command " << code;
+        EXPECT_TRUE(peer.Records() == wire) << "command " << code;
     }
     char reply[8] = "keep";
     EXPECT_EQ(AudioCtrlTransact(AudioCmdRecord {}, nullptr, 8192), -1);
@@ -152,7 +142,7 @@ TEST(Dispatch, EveryActionSendsItsCommandAndTheOthersNothing)
         if (code != 0)
             peer.emplace();
         EXPECT_EQ(RcDispatchAction(action), 0) << action;
-        EXPECT_TRUE(!peer || peer->Record() == Wire(code, arg)) << "action " << action;
+        EXPECT_TRUE(!peer || peer->Records() == Wire(code, arg)) << "action " << action;
     }
     for (const RcAction action : {0, 26, -1})
         EXPECT_EQ(RcDispatchAction(action), 0);

@@ -8,6 +8,7 @@
 
 #include "drivers/hw_raytac.hpp"
 #include "harness.hpp"
+#include "lib/media_peer.hpp"
 
 namespace {
 
@@ -71,14 +72,14 @@ TEST(RaytacRead, AListeningMediaCenterTakesTheKeyAndBadReadsAreDropped)
     raytac.descriptor = device[0];
     vt::Logged();
     EXPECT_EQ(Read(device[1], 0x0007002C), RC_ACT_PLAY);  // nobody listens
-    close(vt::UnixSocket(MEDIA_CENTER_SOCKET_PATH, SOCK_DGRAM, true));  // a socket file left behind
-    EXPECT_EQ(Read(device[1], 0x0007002C), RC_ACT_PLAY);
-    const int ui = vt::UnixSocket(MEDIA_CENTER_SOCKET_PATH, SOCK_DGRAM, true);
-    EXPECT_EQ(Read(device[1], 0x00070057), 0);
-    std::uint32_t got[2] = {};
-    EXPECT_EQ(recv(ui, got, sizeof got, MSG_DONTWAIT), 4);  // the code alone, in this machine's order
-    EXPECT_EQ(got[0], 0x00070057u);
+    UnixFailure failed;
+    const int ui = MediaPeerOpen(&failed);  // the tools' stand-in media center
+    EXPECT_EQ(Read(device[1], 0x0007002C), 0);
+    std::uint32_t code = 0;
+    EXPECT_EQ(MediaPeerTake(ui, &code), 4);  // the code alone, in this machine's order
+    EXPECT_EQ(code, 0x0007002Cu);
     close(ui);
+    EXPECT_EQ(Read(device[1], 0x00070057), RC_ACT_VOLUME_UP);  // its socket file left behind
     unlink(MEDIA_CENTER_SOCKET_PATH);
 
     // Volume Plus is down: reports of other sizes are dropped and leave it so.

@@ -14,7 +14,7 @@ std::vector<std::int32_t> Slots() { return {CtrlSockClients, CtrlSockClients + C
 // A client that has sent bytes, and hung up when told to; it never waits for a full queue.
 int Client(const std::string& bytes = "", bool hangUp = false)
 {
-    const int fd = vt::UnixSocket(RC_CTRL_SOCKET_PATH, SOCK_STREAM | SOCK_NONBLOCK);
+    const int fd = UnixConnect(RC_CTRL_SOCKET_PATH, SOCK_STREAM | SOCK_NONBLOCK, 0, nullptr);
     EXPECT_EQ(write(fd, bytes.data(), bytes.size()), static_cast<ssize_t>(bytes.size()));
     if (hangUp)
         shutdown(fd, SHUT_WR);
@@ -84,7 +84,8 @@ TEST(CtrlSock, OpenReplacesWhatStandsAtThePathAndCloseAlwaysRemovesIt)
 {
     vt::Logged();
     EXPECT_EQ(CtrlSockRead(), 0);  // closed: nothing
-    close(vt::UnixSocket(RC_CTRL_SOCKET_PATH, SOCK_STREAM, true));  // left by an earlier run
+    UnixFailure failed;
+    close(UnixBind(RC_CTRL_SOCKET_PATH, SOCK_STREAM, 4, &failed));  // left by an earlier run
     ASSERT_EQ(CtrlSockOpen(), 0);
     const int fd = vexoctrl.descriptor;
     EXPECT_EQ(CtrlSockOpen(), 0);  // already listening: nothing changes
