@@ -2,7 +2,9 @@
 // would hand them over, between idle waits. A read gives -1, 0 or an action
 // of the receiver, the hold state stays in its range, and a report of a key
 // press leaves that key as the last one.
-// Input: steps, each a byte: 0 an idle wait, n a read of the next n bytes.
+// Input: steps, each a byte: 0 an idle wait; below 0x80, a read of that many
+// of the next bytes; else a report of one of the remote's keys (or another
+// usage) with the next byte as its event value (1, a press, when it is even).
 #include <sys/socket.h>
 
 #include "drivers/hw_raytac.hpp"
@@ -35,13 +37,24 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
             CheckState(h.action);
             continue;
         }
-        fz::Check(send(device, data + i, n, 0) == static_cast<ssize_t>(n), "send");
+        RaytacReport report {};
+        std::string bytes;
+        if (step < 0x80) {  // the next bytes, whatever they are, as one read
+            bytes.assign(reinterpret_cast<const char*>(data + i), n);
+            i += n;
+        } else {  // a key of the remote (or a usage beside one) reaches the hold logic sooner
+            const std::int32_t value = i < size && data[i] % 2 != 0 ? data[i] : RAYTAC_PRESSED;
+            i += i < size ? 1 : 0;
+            const std::uint32_t usage = RaytacKeyMap[step % (RAYTAC_KEY_COUNT + 1)].code | (step & 0x40u);
+            report.events[RAYTAC_KEY_EVENT] = {usage, value};
+            bytes.assign(reinterpret_cast<const char*>(&report), sizeof report);
+        }
+        fz::Check(send(device, bytes.data(), bytes.size(), 0) == static_cast<ssize_t>(bytes.size()), "send");
         CheckState(RaytacRead());
         hiddev_event key {};
-        if (n == sizeof(RaytacReport))
-            std::memcpy(&key, data + i + RAYTAC_KEY_EVENT * sizeof key, sizeof key);
+        if (bytes.size() == sizeof report)
+            std::memcpy(&key, bytes.data() + RAYTAC_KEY_EVENT * sizeof key, sizeof key);
         fz::Check(key.value != RAYTAC_PRESSED || RaytacHold.lastCode == key.hid, "a press not the last key");
-        i += n;
     }
     return 0;
 }

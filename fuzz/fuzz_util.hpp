@@ -4,10 +4,10 @@
 #pragma once
 
 #include <algorithm>
-#include <iterator>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <iterator>
 #include <string>
 
 namespace fz {

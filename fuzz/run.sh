@@ -16,8 +16,9 @@ if ! cmake -S fuzz -B "$build" -DCMAKE_CXX_COMPILER=clang++ >"$build/configure.l
 fi
 pass=0
 fail=0
-for exe in "$build"/bin/fuzz_*; do
-    t=$(basename "$exe")
+for src in fuzz/fuzz_*.cpp; do
+    t=$(basename "$src" .cpp)
+    exe=$build/bin/$t
     mkdir -p "$build/work/$t"
     if tests/sandbox.sh "$exe" -seed=1 -max_total_time="$seconds" -timeout=10 -rss_limit_mb=1024 -print_final_stats=1 \
         -artifact_prefix="$build/$t-" "$build/work/$t" "fuzz/corpus/$t" >"$build/logs/$t.log" 2>&1; then
