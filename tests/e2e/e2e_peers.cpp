@@ -1,8 +1,9 @@
-// The daemon among its peers, each of them the stand-in program itself: the
-// audio daemon (standin-audiod), the radio remote (remote-sim, writing into a
-// FIFO at the receiver's device path), the media-center interface
-// (standin-mediacenter) and a local program (vexorctl). On the PowerPC build
-// they all run big-endian, as on the target.
+// The daemon among its peers when they misbehave, each of them the stand-in
+// program itself: the audio daemon (standin-audiod), the radio remote
+// (remote-sim, writing into a FIFO at the receiver's device path), the
+// media-center interface (standin-mediacenter) and a local program
+// (vexorctl). On the PowerPC build they all run big-endian, as on the target;
+// tests/kernel runs the keys, the hand-over and a replug on a PowerPC kernel.
 #include <optional>
 
 #include "harness.hpp"
@@ -51,17 +52,9 @@ protected:
     std::vector<std::string> allowed_;  // log lines that the test's fault explains
 };
 
-TEST_F(Peers, AListeningMediaCenterTakesTheKeysAndAFrozenOneHoldsNothingUp)
+TEST_F(Peers, AFrozenMediaCenterHoldsNothingUp)
 {
     Start();
-    {
-        vt::Program ui({"standin-mediacenter"});
-        ASSERT_TRUE(ui.Expect("listening /tmp/MediaCenter.sock"));
-        ASSERT_EQ(Remote({"tap", "Play"}), 0);
-        EXPECT_TRUE(ui.Expect("key 0x0007002C"));
-    }
-    ASSERT_EQ(vt::Run({"vexorctl", "stop"}), 0);
-    EXPECT_EQ(Next(), "AUDIO_CMD_STOP (5)");  // the Play went to the interface alone
     vt::Program frozen({"standin-mediacenter", "--frozen"});  // its queue takes ten keys
     ASSERT_TRUE(frozen.Expect("frozen /tmp/MediaCenter.sock"));
     std::vector<std::string> taps;
@@ -91,8 +84,7 @@ TEST_F(Peers, AnAudioDaemonThatHangsHoldsNothingUp)
 TEST_F(Peers, HotplugSignalsCloseAndReopenTheReceiverAndAKeyLeftDownStaysQuiet)
 {
     Start();
-    ASSERT_EQ(Remote({"hold", "Next", "1200", "press", "Volume Plus"}), 0);
-    EXPECT_EQ(Next(), "AUDIO_CMD_NEXT_HELD (33)");  // on the fourth 200 ms wait
+    ASSERT_EQ(Remote({"press", "Volume Plus"}), 0);
     EXPECT_EQ(Next(), "AUDIO_CMD_VOLUME_UP (12)");
     EXPECT_EQ(Next(), "AUDIO_CMD_VOLUME_UP (12)");  // repeated while held
     kill(daemon_->pid, SIGUSR2);

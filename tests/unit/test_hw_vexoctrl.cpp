@@ -83,15 +83,14 @@ TEST(CtrlSock, SilentClientsHoldTheirSlotsAndTheLowestReadySlotIsReadFirst)
 TEST(CtrlSock, OpenReplacesWhatStandsAtThePathAndCloseAlwaysRemovesIt)
 {
     vt::Logged();
-    EXPECT_EQ(CtrlSockRead(), 0);  // closed: nothing
     UnixFailure failed;
     close(UnixBind(RC_CTRL_SOCKET_PATH, SOCK_STREAM, 4, &failed));  // left by an earlier run
     ASSERT_EQ(CtrlSockOpen(), 0);
     const int fd = vexoctrl.descriptor;
     EXPECT_EQ(CtrlSockOpen(), 0);  // already listening: nothing changes
     EXPECT_EQ(vexoctrl.descriptor, fd);
-    EXPECT_EQ(CtrlSockClose(), 0);
-    EXPECT_EQ(fcntl(fd, F_GETFD), -1);
+    CtrlSockClose();
+    EXPECT_EQ(CtrlSockRead(), 0);  // closed: nothing
     vt::WriteFile(RC_CTRL_SOCKET_PATH, "x");
     EXPECT_EQ(CtrlSockClose(), 0);  // closed, it removes the path all the same
     EXPECT_NE(access(RC_CTRL_SOCKET_PATH, F_OK), 0);
