@@ -2,9 +2,10 @@
 // would hand them over, between idle waits. A read gives -1, 0 or an action
 // of the receiver, the hold state stays in its range, and a report of a key
 // press leaves that key as the last one.
-// Input: steps, each a byte: 0 an idle wait; below 0x80, a read of that many
-// of the next bytes; else a report of one of the remote's keys (or another
-// usage) with the next byte as its event value (1, a press, when it is even).
+// Input: steps, each a byte: 0 an idle wait; n below 0x80, a read of 4 n of
+// the next bytes (whole reports read together are handed out one per read);
+// else a report of one of the remote's keys (or another usage) with the next
+// byte as its event value (1, a press, when it is even).
 #include <sys/socket.h>
 
 #include "drivers/hw_raytac.hpp"
@@ -30,7 +31,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     RaytacHold = {};
     for (std::size_t i = 0; i < size;) {
         const std::uint8_t step = data[i++];
-        const std::size_t n = std::min<std::size_t>(step, size - i);
+        const std::size_t n = std::min<std::size_t>(4u * step, size - i);
         if (step == 0) {  // what a read does when 200 ms pass without a report
             const RaytacHandOver h = RaytacStep(RaytacHold, RaytacEvent {true, {}});
             fz::Check(!h.offer || h.code == RaytacHold.lastCode, "an idle wait offered another key");
@@ -50,10 +51,12 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
             bytes.assign(reinterpret_cast<const char*>(&report), sizeof report);
         }
         fz::Check(send(device, bytes.data(), bytes.size(), 0) == static_cast<ssize_t>(bytes.size()), "send");
-        CheckState(RaytacRead());
-        hiddev_event key {};
-        if (bytes.size() == sizeof report)
-            std::memcpy(&key, bytes.data() + RAYTAC_KEY_EVENT * sizeof key, sizeof key);
+        const bool whole = !bytes.empty() && bytes.size() % sizeof report == 0;
+        for (std::size_t reads = whole ? bytes.size() / sizeof report : 1; reads > 0; --reads)
+            CheckState(RaytacRead());  // reports read together are handed out one per read
+        hiddev_event key {};  // the last of them is the last key
+        if (whole)
+            std::memcpy(&key, &bytes[bytes.size() - sizeof report + RAYTAC_KEY_EVENT * sizeof key], sizeof key);
         fz::Check(key.value != RAYTAC_PRESSED || RaytacHold.lastCode == key.hid, "a press not the last key");
     }
     return 0;

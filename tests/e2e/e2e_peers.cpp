@@ -84,7 +84,11 @@ TEST_F(Peers, AnAudioDaemonThatHangsHoldsNothingUp)
 TEST_F(Peers, HotplugSignalsCloseAndReopenTheReceiverAndAKeyLeftDownStaysQuiet)
 {
     Start();
-    ASSERT_EQ(Remote({"press", "Volume Plus"}), 0);
+    ASSERT_EQ(Remote({"press", "Next"}), 0);
+    for (int i = 0; i < 150; ++i, usleep(2000))  // a storm of them in a short press: the waits resume
+        kill(daemon_->pid, SIGUSR1);
+    ASSERT_EQ(Remote({"release", "Next", "press", "Volume Plus"}), 0);
+    EXPECT_EQ(Next(), "AUDIO_CMD_NEXT (6)");
     EXPECT_EQ(Next(), "AUDIO_CMD_VOLUME_UP (12)");
     EXPECT_EQ(Next(), "AUDIO_CMD_VOLUME_UP (12)");  // repeated while held
     kill(daemon_->pid, SIGUSR2);

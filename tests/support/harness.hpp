@@ -152,18 +152,28 @@ inline std::vector<std::string> Logged()
     return lines;
 }
 
-// The real vexorcd, started with its built-in paths; ready once its loop
-// serves a client (its signal handlers are then in place). Else pid stays 0
-// and the test fails. Killed at the end if it still runs.
+// A child of ours that we did not start (other than other): a daemon that
+// has detached, its parent gone. 0 when there is none.
+inline pid_t Adopted(pid_t other = 0)
+{
+    const std::string self = std::to_string(getpid());
+    std::istringstream children(ReadFile("/proc/" + self + "/task/" + self + "/children"));
+    pid_t found = 0;
+    for (pid_t child = 0; children >> child;)
+        found = started.count(child) == 0 && child != other ? child : found;
+    return found;
+}
+
+// The real vexorcd, started with its built-in paths (or one of ours that
+// started already); ready once its loop serves a client (its signal handlers
+// are then in place). Else pid stays 0 and the test fails. Killed at the end
+// if it still runs.
 struct Daemon {
+    explicit Daemon(pid_t adopted) : pid(adopted) {}
     Daemon()
     {
         EXPECT_EQ(Run({"vexorcd"}), 0);
-        // daemon() has forked and the parent has gone: the orphan is ours.
-        const std::string self = std::to_string(getpid());
-        std::istringstream children(ReadFile("/proc/" + self + "/task/" + self + "/children"));
-        for (pid_t child = 0; children >> child;)
-            pid = started.count(child) == 0 ? child : pid;
+        pid = Adopted();
         if (pid <= 0 || !WaitUntil([] { return Run({"vexorctl", "0"}) == 0; }, 10000)) {
             ADD_FAILURE() << "vexorcd did not start";
             Stop(SIGKILL);

@@ -52,46 +52,62 @@ TEST(RaytacStep, EveryKeyAtItsPressWhileHeldAndAtItsRelease)
         }
 }
 
-// Writes size bytes of press reports of code, cut or repeated, into the pipe
-// that the driver reads in place of its device, and reads once.
-std::int32_t Read(int device, std::uint32_t code, std::size_t size = sizeof(RaytacReport))
+// Writes reports of the keys {usage, value} in one piece into the pipe that
+// the driver reads in place of its device (repeated and cut to size bytes
+// when size is given), then reads reads times: the results.
+std::string Send(int device, const std::vector<hiddev_event>& keys, std::size_t size = 0, std::size_t reads = 1)
 {
-    RaytacReport report {};
-    report.events[RAYTAC_KEY_EVENT] = {code, RAYTAC_PRESSED};
-    std::string bytes;
-    for (std::size_t i = 0; i < size; ++i)
-        bytes += reinterpret_cast<const char*>(&report)[i % sizeof report];
-    EXPECT_EQ(write(device, bytes.data(), size), static_cast<ssize_t>(size));
-    return RaytacRead();
+    std::string bytes, results;
+    for (const hiddev_event& key : keys) {
+        RaytacReport report {};
+        report.events[RAYTAC_KEY_EVENT] = key;
+        bytes.append(reinterpret_cast<const char*>(&report), sizeof report);
+    }
+    while (bytes.size() < size)
+        bytes += bytes;
+    bytes.resize(size > 0 ? size : bytes.size());
+    EXPECT_EQ(write(device, bytes.data(), bytes.size()), static_cast<ssize_t>(bytes.size()));
+    while (reads-- > 0)
+        results += std::to_string(RaytacRead()) + " ";
+    return results;
 }
 
-TEST(RaytacRead, AListeningMediaCenterTakesTheKeyAndBadReadsAreDropped)
+TEST(RaytacRead, ReportsOneByOneAListeningMediaCenterAndBadReads)
 {
     int device[2];
     ASSERT_EQ(pipe2(device, O_CLOEXEC), 0);
     raytac.descriptor = device[0];
     vt::Logged();
-    EXPECT_EQ(Read(device[1], 0x0007002C), RC_ACT_PLAY);  // nobody listens
+    const hiddev_event play {0x0007002C, 1}, playUp {0x0007002C, 0}, next {0x00070011, 1};
+    EXPECT_EQ(Send(device[1], {play}), "6 ");  // nobody listens
     UnixFailure failed;
     const int ui = MediaPeerOpen(&failed);  // the tools' stand-in media center
-    EXPECT_EQ(Read(device[1], 0x0007002C), 0);
+    EXPECT_EQ(Send(device[1], {play}), "0 ");
     std::uint32_t code = 0;
     EXPECT_EQ(MediaPeerTake(ui, &code), 4);  // the code alone, in this machine's order
     EXPECT_EQ(code, 0x0007002Cu);
     close(ui);
-    EXPECT_EQ(Read(device[1], 0x00070057), RC_ACT_VOLUME_UP);  // its socket file left behind
+    EXPECT_EQ(Send(device[1], {{0x00070057, 1}}), "9 ");  // its socket file left behind
     unlink(MEDIA_CENTER_SOCKET_PATH);
-
-    // Volume Plus is down: reports of other sizes are dropped and leave it so.
+    // Reports that come in one read are handled one per read, in order; seven fit in a read.
+    for (const auto& [keys, reads] : {std::pair<std::vector<hiddev_event>, std::string> {
+             {{0x00070057, 0}, {0x0007004F, 1}}, "0 2 "},  // Volume Plus released with Stop: no runaway
+             {{play, playUp, next}, "6 0 0 "},
+             {{play, playUp, play, playUp, play, playUp, next, {0x00070011, 0}}, "6 0 6 0 6 0 0 7 "}})
+        EXPECT_EQ(Send(device[1], keys, 0, keys.size()), reads);
+    // Reads that are not whole reports are dropped; they may have held a release, so the hold ends.
+    for (const std::size_t size : {80u, 150u, 7u}) {
+        EXPECT_EQ(Send(device[1], {{0x00070057, 1}}), "9 ");
+        EXPECT_EQ(Send(device[1], {play}, size), "-1 ");
+        EXPECT_EQ(RaytacHold.heldAction, 0) << size;
+    }
     const RaytacHoldState held = RaytacHold;
-    for (const std::size_t size : {80u, 144u, 7u})
-        EXPECT_EQ(Read(device[1], 0x0007002C, size), -1) << size;
-    EXPECT_EQ(std::memcmp(&RaytacHold, &held, sizeof held), 0);
     raytac.descriptor = open("/tmp", O_RDONLY | O_DIRECTORY | O_CLOEXEC);  // its reads fail, silently
     EXPECT_EQ(RaytacRead(), -1);
+    EXPECT_EQ(std::memcmp(&RaytacHold, &held, sizeof held), 0);
     EXPECT_EQ(vt::Logged(), (std::vector<std::string> {
                                 "hw_raytac.cpp (311) The hid response is too short. ret:80 (10)",
-                                "hw_raytac.cpp (311) The hid response is too short. ret:144 (18)",
+                                "hw_raytac.cpp (311) The hid response is too short. ret:150 (18)",
                                 "hw_raytac.cpp (304) Got short read from device!"}));
     RaytacClose();
     close(device[0]);
@@ -108,6 +124,10 @@ TEST(RaytacDevice, OpeningTheDeviceForgetsAKeyLeftDown)
     RaytacHold = {0x00070057, 0, RC_ACT_VOLUME_UP};
     EXPECT_EQ(RaytacOpen(), 0);  // already open: nothing changes
     EXPECT_EQ(RaytacHold.heldAction, RC_ACT_VOLUME_UP);
+    EXPECT_EQ(Send(writer, {{0x0007002C, 1}, {0x0007004F, 1}}), "6 ");
+    RaytacClose();  // and the report not yet handed out goes with the device
+    EXPECT_EQ(RaytacOpen(), 0);
+    EXPECT_EQ(RaytacRead(), 0);
     RaytacClose();
     close(writer);
     unlink(RC_RAYTAC_DEVICE_PATH);
