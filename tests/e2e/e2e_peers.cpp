@@ -11,8 +11,9 @@
 
 namespace {
 
-// The daemon stops within its receiver's wait and an exchange under way, and room for the emulator.
-constexpr int STOP_MS = 200 + 500 + 2000;
+// The daemon stops within its receiver's wait and an exchange under way (a connect and a reply of
+// 500 ms each), and room for the emulator.
+constexpr int STOP_MS = 200 + 1000 + 2000;
 
 int Remote(std::vector<std::string> script)
 {
