@@ -64,7 +64,7 @@ TEST(AudioExchange, OneRecordOutAndOneAnswerInWithinTheBudget)
         {Mode::Answer, 0, 0, 0, 400, ok, {}},  // the rest of the buffer is cleared
         {Mode::AnswerHuge, 0, 0, 0, 400, std::string(32, 'h'), {}},
         {Mode::AnswerLate, 200, 0, 150, 450, ok, {}},         // within the budget
-        {Mode::NeverAnswer, 0, -1, 480, 1000, untouched, {}},  // given up after the budget
+        {Mode::AnswerLate, 1500, -1, 480, 1000, untouched, {}},  // given up after the budget
         {Mode::CloseWithoutAnswer, 0, -1, 0, 400, cleared, {"ctrl.cpp:90 Failed to read action [Success]"}},
         {std::nullopt, 0, -1, 0, 400, untouched, {NO_PEER}},
     };
