@@ -1,6 +1,7 @@
 // The daemon's lifecycle as only the real binary shows it: the usage text,
 // the pid file and the single-instance guard, signals, a clean stop. Each test
 // fails on a system log line it does not expect.
+#include <sys/mount.h>
 #include <sys/stat.h>
 
 #include "harness.hpp"
@@ -105,18 +106,30 @@ TEST(Lifecycle, APidFileOfNoLiveProcessIsReplacedAndOneThatCannotBeWrittenIsLogg
         EXPECT_EQ(daemon.Stop(), 0);
     }
     EXPECT_TRUE(vt::Logged().empty());
-    // A directory, and a symlink, which is never followed.
+    // A directory; a symlink, never followed; a full file system, where the file stays empty and
+    // locked, so that a second start is still refused.
     vt::WriteFile("/tmp/precious", "keep");
-    for (const auto& [link, reason] :
-         {std::pair {false, "Is a directory"}, {true, "Too many levels of symbolic links"}}) {
-        ASSERT_EQ(link ? symlink("/tmp/precious", RC_PID_FILE) : mkdir(RC_PID_FILE, 0755), 0);
+    for (const auto& [fault, reason] : {std::pair<std::string, std::string> {"directory", "Is a directory"},
+                                        {"symlink", "Too many levels of symbolic links"},
+                                        {"full", "No space left on device"}}) {
+        if (fault == "directory") {
+            ASSERT_EQ(mkdir(RC_PID_FILE, 0755), 0);
+        } else if (fault == "symlink") {
+            ASSERT_EQ(symlink("/tmp/precious", RC_PID_FILE), 0);
+        } else {
+            ASSERT_EQ(mount("vexo-full", "/run", "tmpfs", 0, "size=4k"), 0);
+            vt::WriteFile("/run/filler", std::string(4096, 'x'));
+        }
         vt::Daemon daemon;  // it serves all the same
         EXPECT_GT(daemon.pid, 0);
+        std::string second;
+        EXPECT_EQ(fault == "full" ? vt::Run({"vexorcd"}, &second) : 0, 0);
+        EXPECT_EQ(second, fault == "full" ? "vexorcd already exists. pid[0]\n" : "");
         EXPECT_EQ(daemon.Stop(), 0);
         EXPECT_EQ(vt::ReadFile("/tmp/precious"), "keep");
         const std::string line = "vexorcd.cpp (119) Failed to write vexorcd pid [/var/run/vexorcd.pid]. (";
         EXPECT_EQ(vt::Logged(), std::vector<std::string> {line + reason + ")"});
-        remove(RC_PID_FILE);
+        fault == "full" ? umount2("/run", MNT_DETACH) : remove(RC_PID_FILE);
     }
 }
 
