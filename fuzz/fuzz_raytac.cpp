@@ -2,10 +2,10 @@
 // would hand them over, between idle waits. A read gives -1, 0 or an action
 // of the receiver, the hold state stays in its range, and a report of a key
 // press leaves that key as the last one.
-// Input: steps, each a byte: 0 an idle wait; n below 0x80, a read of 4 n of
-// the next bytes (whole reports read together are handed out one per read);
-// else a report of one of the remote's keys (or another usage) with the next
-// byte as its event value (1, a press, when it is even).
+// Input: steps, each a byte: 0 an idle wait; n below 0x80, one read of 4 n
+// of the next bytes, 504 at most (whole reports read together are handed out
+// one per read); else a report of one of the remote's keys (or another usage)
+// with the next byte as its event value (1, a press, when it is even).
 #include <sys/socket.h>
 
 #include "drivers/hw_raytac.hpp"
@@ -31,7 +31,9 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     RaytacHold = {};
     for (std::size_t i = 0; i < size;) {
         const std::uint8_t step = data[i++];
-        const std::size_t n = std::min<std::size_t>(4u * step, size - i);
+        // No more than a read asks for: a packet socket would drop the rest, where hiddev keeps it.
+        const std::size_t most = sizeof(RaytacReport) * RAYTAC_READ_REPORTS;
+        const std::size_t n = std::min({std::size_t {4u} * step, size - i, most});
         if (step == 0) {  // what a read does when 200 ms pass without a report
             const RaytacHandOver h = RaytacStep(RaytacHold, RaytacEvent {true, {}});
             fz::Check(!h.offer || h.code == RaytacHold.lastCode, "an idle wait offered another key");
