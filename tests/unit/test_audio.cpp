@@ -1,6 +1,9 @@
 // The audio daemon client against the tools' stand-in audio daemon, run on a
 // thread: the exchange and its faults, every argument form byte for byte, the
 // refusals, and the command each remote action sends.
+#include <pthread.h>
+
+#include <atomic>
 #include <climits>
 #include <cstring>
 #include <mutex>
@@ -81,6 +84,33 @@ TEST(AudioExchange, OneRecordOutAndOneAnswerInWithinTheBudget)
         EXPECT_EQ(std::string(reply, sizeof reply), r.reply + "xxxxxxxx");
         EXPECT_EQ(vt::Logged(), r.log);
     }
+}
+
+TEST(AudioExchange, HotPlugSignalsDuringAConnectThatWaitsForRoomDoNotLoseTheCommand)
+{
+    vt::Logged();
+    struct sigaction quiet {};  // restarting, as the daemon's: the send time-out still ends the connect
+    quiet.sa_handler = [](int) {}, quiet.sa_flags = SA_RESTART;
+    ASSERT_EQ(sigaction(SIGUSR1, &quiet, nullptr), 0);
+    AudioPeer peer;  // listening, its queue full, serving only after 200 ms: the connect waits
+    std::string error;
+    ASSERT_TRUE(peer.Listen(&error, 0)) << error;
+    std::vector<int> queued;
+    for (int fd; (fd = UnixConnect(AUDIO_SOCKET_PATH, SOCK_STREAM, 1, nullptr)) >= 0;)
+        queued.push_back(fd);
+    std::atomic<bool> done {false};
+    std::thread storm([&, client = pthread_self()] {
+        for (int ms = 0; !done; ms += 5, usleep(5000))
+            if (pthread_kill(client, SIGUSR1) == 0 && ms == 200) {
+                std::for_each(queued.begin(), queued.end(), close);
+                peer.Start();
+            }
+    });
+    char reply[8];
+    EXPECT_TRUE(!queued.empty() && AudioCtrlTransact(AudioCmdRecord {}, reply, sizeof reply) == 0);
+    done = true;
+    storm.join();
+    EXPECT_EQ(vt::Logged(), std::vector<std::string> {});
 }
 
 TEST(AudioForms, EveryArgumentFormArrivesByteForByteAndRefusalsSendNothing)
