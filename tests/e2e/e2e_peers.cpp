@@ -3,7 +3,8 @@
 // (remote-sim, writing into a FIFO at the receiver's device path), the
 // media-center interface (standin-mediacenter) and a local program
 // (vexorctl). On the PowerPC build they all run big-endian, as on the target;
-// tests/kernel runs the keys, the hand-over and a replug on a PowerPC kernel.
+// tests/kernel runs the keys, the hand-over and a replug on a PowerPC kernel,
+// and the receiver's unit test pins that a reopen forgets a key left down.
 #include <optional>
 
 #include "harness.hpp"
@@ -82,7 +83,7 @@ TEST_F(Peers, AnAudioDaemonThatHangsHoldsNothingUp)
     }
 }
 
-TEST_F(Peers, HotplugSignalsCloseAndReopenTheReceiverAndAKeyLeftDownStaysQuiet)
+TEST_F(Peers, HotplugSignalsNeitherCutAShortPressLongNorLeaveAClosedReceiverRepeating)
 {
     Start();
     ASSERT_EQ(Remote({"press", "Next"}), 0);
@@ -98,12 +99,7 @@ TEST_F(Peers, HotplugSignalsCloseAndReopenTheReceiverAndAKeyLeftDownStaysQuiet)
     std::string line;
     while ((line = Next()) == "AUDIO_CMD_VOLUME_UP (12)") {
     }
-    EXPECT_EQ(line, "AUDIO_CMD_STOP (5)");
-    kill(daemon_->pid, SIGUSR1);
-    ASSERT_TRUE(ProcWaitHoldsOpen(daemon_->pid, RC_RAYTAC_DEVICE_PATH, true, 5000));
-    // Its release never came, but the reopened receiver has forgotten the key.
-    ASSERT_EQ(Remote({"sleep", "600", "release", "Volume Plus", "tap", "Stop"}), 0);
-    EXPECT_EQ(Next(), "AUDIO_CMD_STOP (5)");
+    EXPECT_EQ(line, "AUDIO_CMD_STOP (5)");  // and the repeats have ended with the close
 }
 
 }  // namespace
