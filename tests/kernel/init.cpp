@@ -25,6 +25,7 @@
 #include <thread>
 #include <vector>
 
+#include "common/paths.hpp"
 #include "drivers/hiddev.hpp"
 
 namespace {
@@ -165,9 +166,9 @@ void Settle()
 // Binds the gadget; the daemon's path leads to the node that appears.
 bool Plug()
 {
-    unlink("/dev/usb/hiddev5");
+    unlink(RC_RAYTAC_DEVICE_PATH);
     return WriteFile(GADGET + "/UDC", "dummy_udc.0") && WaitFor("/dev/usb/hiddev0", 5000) &&
-           symlink("hiddev0", "/dev/usb/hiddev5") == 0;
+           symlink("hiddev0", RC_RAYTAC_DEVICE_PATH) == 0;
 }
 
 bool MakeGadget()
@@ -186,7 +187,7 @@ bool MakeGadget()
 // device (its own output goes to the null device once it has detached).
 std::string Describe()
 {
-    const int fd = open("/dev/usb/hiddev5", O_RDONLY | O_CLOEXEC);
+    const int fd = open(RC_RAYTAC_DEVICE_PATH, O_RDONLY | O_CLOEXEC);
     const int file = open("/tmp/describe", O_WRONLY | O_CREAT | O_TRUNC, 0644);
     const int console = dup(1);
     dup2(file, 1);
@@ -235,13 +236,13 @@ void RunRow(const Row& row)
         Stop(audiod);
         audiod = Spawn(std::string("/bin/standin-audiod ") + row.audiod, audio.log);
         audiodOptions = row.audiod;
-        WaitFor("/tmp/vexoaudiod.sock", 5000);
+        WaitFor(AUDIO_SOCKET_PATH, 5000);
     }
     if (!row.mediaCenter) {
         Stop(mediaCenter);
     } else if (mediaCenter < 0) {
         mediaCenter = Spawn("/bin/standin-mediacenter", media.log);
-        WaitFor("/tmp/MediaCenter.sock", 5000);
+        WaitFor(MEDIA_CENTER_SOCKET_PATH, 5000);
     }
     if (demo)
         std::printf("\n== %s\n      %-18s %s\n", row.name, "input", row.script);
@@ -289,10 +290,10 @@ void RunAll()
           id);
 
     pid_t sink = Spawn("/bin/syslog-sink", logged.log);
-    WaitFor("/dev/log", 5000);
+    WaitFor(SYSLOG_SOCKET_PATH, 5000);
     Finish(Spawn("/bin/vexorcd", "/tmp/vexorcd.out"));
-    WaitFor("/tmp/vexoctrl", 5000);
-    const pid_t daemon = std::atoi(ReadFile("/var/run/vexorcd.pid").c_str());
+    WaitFor(RC_CTRL_SOCKET_PATH, 5000);
+    const pid_t daemon = std::atoi(ReadFile(RC_PID_FILE).c_str());
     Check("vexorcd started", daemon > 0);
     for (const Row& row : ROWS)
         RunRow(row);
@@ -321,7 +322,7 @@ void RunAll()
 
     kill(daemon, SIGTERM);
     Check("SIGTERM: clean exit, pid file gone",
-          Finish(daemon) == 0 && access("/var/run/vexorcd.pid", F_OK) != 0);
+          Finish(daemon) == 0 && access(RC_PID_FILE, F_OK) != 0);
     Stop(audiod);
     Stop(sink);
     std::printf("kernel: %d passed, %d failed\n", passed, failed);

@@ -1,4 +1,4 @@
-// The control socket against clients on "/tmp/vexoctrl", and the listening
+// The control socket against clients on its built-in path, and the listening
 // socket it is built on.
 #include <sys/stat.h>
 
