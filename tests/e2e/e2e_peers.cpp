@@ -16,12 +16,6 @@ namespace {
 // 500 ms each), and room for the emulator.
 constexpr int STOP_MS = 200 + 1000 + 2000;
 
-int Remote(std::vector<std::string> script)
-{
-    script.insert(script.begin(), "remote-sim");
-    return vt::Run(script);
-}
-
 class Peers : public ::testing::Test {
 protected:
     // The audio daemon's stand-in, the remote's FIFO and the daemon.
@@ -59,10 +53,10 @@ TEST_F(Peers, AFrozenMediaCenterHoldsNothingUp)
     Start();
     vt::Program frozen({"standin-mediacenter", "--frozen"});  // its queue takes ten keys
     ASSERT_TRUE(frozen.Expect("frozen /tmp/MediaCenter.sock"));
-    std::vector<std::string> taps;
+    std::vector<std::string> taps {"remote-sim"};
     for (int i = 0; i < 12; ++i)
         taps.insert(taps.end(), {"tap", "Play"});
-    ASSERT_EQ(Remote(taps), 0);
+    ASSERT_EQ(vt::Run(taps), 0);
     EXPECT_EQ(Next(), "AUDIO_CMD_PLAY (4)");  // the daemon acts on the others itself
 }
 
@@ -77,7 +71,7 @@ TEST_F(Peers, AnAudioDaemonThatHangsHoldsNothingUp)
         Start({"standin-audiod", mode});
         for (int i = 0; i < 6; ++i)
             ASSERT_EQ(vt::Run({"vexorctl", "play"}), 0) << mode << ": action " << i << " was not taken";
-        ASSERT_EQ(Remote({"tap", "Stop"}), 0);
+        ASSERT_EQ(vt::Run({"remote-sim", "tap", "Stop"}), 0);
         ASSERT_EQ(vt::Run({"vexorctl", "play"}), 0);
         EXPECT_EQ(daemon_->Stop(SIGTERM, STOP_MS), 0) << mode;
     }
@@ -86,10 +80,10 @@ TEST_F(Peers, AnAudioDaemonThatHangsHoldsNothingUp)
 TEST_F(Peers, HotplugSignalsNeitherCutAShortPressLongNorLeaveAClosedReceiverRepeating)
 {
     Start();
-    ASSERT_EQ(Remote({"press", "Next"}), 0);
+    ASSERT_EQ(vt::Run({"remote-sim", "press", "Next"}), 0);
     for (int i = 0; i < 150; ++i, usleep(2000))  // a storm of them in a short press: the waits resume
         kill(daemon_->pid, SIGUSR1);
-    ASSERT_EQ(Remote({"release", "Next", "press", "Volume Plus"}), 0);
+    ASSERT_EQ(vt::Run({"remote-sim", "release", "Next", "press", "Volume Plus"}), 0);
     EXPECT_EQ(Next(), "AUDIO_CMD_NEXT (6)");
     EXPECT_EQ(Next(), "AUDIO_CMD_VOLUME_UP (12)");
     EXPECT_EQ(Next(), "AUDIO_CMD_VOLUME_UP (12)");  // repeated while held

@@ -4,7 +4,6 @@
 # prints the checks that the machine's init (init.cpp) makes. Needs root.
 #   bash tests/kernel/run.sh                 the checks, then "kernel: N passed, N failed"
 #   bash tests/kernel/run.sh --demo          the same session, showing what each peer got
-#   bash tests/kernel/run.sh --build-kernel  only build the kernel (if missing)
 # The kernel is built once per machine (niced, 5 to 14 minutes) from
 # linux-source-6.1 and kernel.config into /var/cache/vexorcd-kernel/HASH.
 set -euo pipefail
@@ -13,8 +12,7 @@ root=$(cd "$here/../.." && pwd)
 case "${1:-}" in
 "") mode=check filter='^(ok  |FAIL|machine up)' ;;
 --demo) mode=demo filter='' ;;
---build-kernel) mode=kernel ;;
-*) sed -n '2,9p' "$0" | sed 's/^# \{0,1\}//'; exit 2 ;;
+*) sed -n '2,8p' "$0" | sed 's/^# \{0,1\}//'; exit 2 ;;
 esac
 fail() { echo "FAIL $*"; echo "kernel: 0 passed, 1 failed"; exit 1; }
 [ "$(id -u)" = 0 ] || fail "run as root"
@@ -40,10 +38,9 @@ if [ ! -f "$vmlinux" ]; then
     rm -rf "$tree"
     echo "kernel built in $((SECONDS - t0)) s"
 fi
-[ "$mode" = kernel ] && exit 0
 
 # The initramfs: our init, the PowerPC programs and the C library they need.
-programs=(vexorcd vexorctl standin-audiod standin-mediacenter syslog-sink remote-sim)
+programs=(vexorcd standin-audiod standin-mediacenter syslog-sink remote-sim)
 ( cd "$root" && cmake --preset ppc >/dev/null &&
   cmake --build --preset ppc --target "${programs[@]}" kernel-init >/dev/null ) || fail "PowerPC build"
 bin=$root/build/ppc/bin out=$root/build/ppc/kernel

@@ -1,7 +1,7 @@
 #!/bin/bash
 # What a newcomer meets first: every program's --help exits 0, vexorctl
-# explains a missing audio daemon and a code that is no action on standard
-# error, and the demo's --shell works on a terminal and from standard input.
+# explains a missing audio daemon on standard error, and the demo's --shell
+# works on a terminal and from standard input.
 set -u
 bin=${VEXO_BIN_DIR:?} emu=${VEXO_EMULATOR:-} fail=0
 check() {  # check WHAT COMMAND...: one line per check
@@ -13,8 +13,6 @@ done
 err=$($emu "$bin/vexorctl" audio play 2>&1 >/dev/null)
 check "vexorctl shows why the audio daemon did not take a command" grep -qF \
     'vexorctl: ctrl.cpp:27 Failed to connect to /tmp/vexoaudiod.sock. [No such file or directory]' <<<"$err"
-err=$($emu "$bin/vexorctl" 26 2>&1)
-check "vexorctl notes that 26 is no action" grep -qF '26: not an action (1 to 25)' <<<"$err"
 
 session() { VEXO_DEMO_SHELL=1 bash "$VEXO_SOURCE_DIR/scripts/demo-session.sh" 2>&1; }
 out=$(printf 'vexorctl play\n' | session)
@@ -24,5 +22,4 @@ check "--shell without a terminal runs each line, then shows what the peers got"
 mkdir -p /dev/pts && mount -t devpts -o newinstance,ptmxmode=0666 devpts /dev/pts && ln -sf pts/ptmx /dev/ptmx
 out=$(printf 'echo "shell-$((6 * 7))"\nexit\n' | script -qec "$(declare -f session); session" /dev/null)
 check "--shell on a terminal gives a shell" grep -q 'shell-42' <<<"$out"
-check "... and the session ends cleanly after it" grep -q 'stopped cleanly' <<<"$out"
 exit $fail
