@@ -13,6 +13,7 @@
 #include <ctime>
 
 #include "audioctl/playlist.hpp"
+#include "common/clock.hpp"
 #include "common/log.hpp"
 #include "common/socket.hpp"
 #include "vlibc/audioconf.hpp"
@@ -65,20 +66,13 @@ static_assert(CatalogueInCodeOrder());
 
 static_assert(sizeof AUDIO_SOCKET_PATH <= sizeof(sockaddr_un::sun_path));
 
-std::int64_t NowUs()
-{
-    timespec ts {};
-    clock_gettime(CLOCK_MONOTONIC, &ts);
-    return static_cast<std::int64_t>(ts.tv_sec) * 1000000 + ts.tv_nsec / 1000;
-}
-
 // Waits until fd reports one of events or the monotonic deadline passes; a
 // signal does not end the wait early. Returns the reported events, 0 on
 // time-out, -1 on error.
 int WaitUntilDeadline(int fd, short events, std::int64_t deadlineUs)
 {
     for (;;) {
-        std::int64_t left = deadlineUs - NowUs();
+        std::int64_t left = deadlineUs - ClockMonotonicUs();
         if (left < 0)
             left = 0;
         timespec ts {};
@@ -104,7 +98,7 @@ int ConnectBounded(int fd)
 {
     sockaddr_un addr;
     SocketFillAddress(addr, AUDIO_SOCKET_PATH);
-    const std::int64_t deadline = NowUs() + AUDIO_BUDGET_US;
+    const std::int64_t deadline = ClockMonotonicUs() + AUDIO_BUDGET_US;
     std::int64_t left = AUDIO_BUDGET_US;
     for (;;) {
         timeval limit {};
@@ -117,7 +111,7 @@ int ConnectBounded(int fd)
         if (errno != EINTR)
             return -1;
         // Never retried with 0 left: a time-out of 0 would mean no limit at all.
-        left = deadline - NowUs();
+        left = deadline - ClockMonotonicUs();
         if (left <= 0) {
             errno = EAGAIN;  // the budget is spent, as by a connect that timed out
             return -1;
@@ -129,7 +123,7 @@ int ConnectBounded(int fd)
 std::int32_t Exchange(int fd, const AudioCmdRecord& request, char* reply,
                       std::int32_t replyCapacity)
 {
-    const std::int64_t deadline = NowUs() + AUDIO_BUDGET_US;
+    const std::int64_t deadline = ClockMonotonicUs() + AUDIO_BUDGET_US;
 
     const int writable = WaitUntilDeadline(fd, POLLOUT, deadline);
     if (writable <= 0)

@@ -4,20 +4,10 @@
 #include <sys/select.h>
 
 #include <cerrno>
-#include <ctime>
+
+#include "common/clock.hpp"
 
 bool (*HiddevStopWaiting)() = nullptr;
-
-namespace {
-
-std::int64_t MonotonicUs()
-{
-    timespec now {};
-    clock_gettime(CLOCK_MONOTONIC, &now);
-    return static_cast<std::int64_t>(now.tv_sec) * 1000000 + now.tv_nsec / 1000;
-}
-
-}  // namespace
 
 // The request numbers differ between architectures in their direction bits
 // (0x40 on PowerPC, 0x80 on x86); the record sizes are the same on both.
@@ -56,7 +46,7 @@ HiddevWait HiddevWaitReadable(std::int32_t descriptor, long timeoutUs)
 {
     // A wait that a signal cut short resumes for what is left of it, taken
     // from the monotonic clock (select does not say, under an emulator).
-    const std::int64_t deadline = MonotonicUs() + timeoutUs;
+    const std::int64_t deadline = ClockMonotonicUs() + timeoutUs;
     std::int64_t left = timeoutUs;
     for (;;) {
         fd_set readable;
@@ -70,7 +60,7 @@ HiddevWait HiddevWaitReadable(std::int32_t descriptor, long timeoutUs)
             return HiddevWait::TimedOut;
         if (errno != EINTR || (HiddevStopWaiting != nullptr && HiddevStopWaiting()))
             return HiddevWait::Ended;
-        left = deadline - MonotonicUs();
+        left = deadline - ClockMonotonicUs();
         if (left < 0)
             left = 0;
     }
